@@ -1,0 +1,46 @@
+#include "platform/os/Log.h"
+
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <string>
+
+namespace os {
+
+namespace {
+
+struct Sink {
+  bool toStderr;
+  std::string prefix;
+
+  Sink() {
+    const char* setting = std::getenv("AXD_LOG");
+    toStderr = setting && std::strcmp(setting, "stderr") == 0;
+    prefix = std::string(program_invocation_short_name) + "[" + std::to_string(getpid()) + "]: ";
+    openlog(program_invocation_short_name, LOG_PID | LOG_NDELAY, LOG_DAEMON);
+  }
+};
+
+const Sink& sink() {
+  static const Sink kSink;
+  return kSink;
+}
+
+}  // namespace
+
+void Log::write(int level, std::string_view message) {
+  const Sink& s = sink();
+  syslog(level, "%.*s", static_cast<int>(message.size()), message.data());
+  if (!s.toStderr) return;
+  std::string line = s.prefix;
+  line.append(message);
+  line.push_back('\n');
+  // One write() per line keeps lines of concurrent threads whole.
+  ssize_t ignored = ::write(STDERR_FILENO, line.data(), line.size());
+  (void)ignored;
+}
+
+}  // namespace os

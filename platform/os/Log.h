@@ -1,0 +1,16 @@
+#pragma once
+
+#include <string_view>
+
+namespace os {
+
+// The system log. Lines go to syslog under the program's name (so the daemon's ident is "axd")
+// and, when the environment variable AXD_LOG is "stderr", also to standard error as
+// "<ident>[<pid>]: <message>". Safe to call from any thread; each call writes one whole line.
+class Log {
+ public:
+  // Syslog priorities: 3 error, 4 warning, 5 notice, 6 info, 7 debug.
+  static void write(int level, std::string_view message);
+};
+
+}  // namespace os

@@ -1,0 +1,79 @@
+#include "platform/value/Dictionary.h"
+
+#include <algorithm>
+
+#include "platform/value/Value.h"
+
+namespace value {
+
+namespace {
+
+bool keyLess(const Dictionary::Entry& entry, std::string_view key) {
+  return entry.first < key;
+}
+
+const std::vector<Dictionary::Entry>& emptyEntries() {
+  static const std::vector<Dictionary::Entry> kEmpty;
+  return kEmpty;
+}
+
+}  // namespace
+
+Dictionary::Dictionary() = default;
+
+Dictionary::Dictionary(std::initializer_list<Entry> entries)
+    : Dictionary(std::map<std::string, Value>(entries.begin(), entries.end())) {}
+
+Dictionary::Dictionary(std::map<std::string, Value> entries)
+    : entries_(std::make_shared<const std::vector<Entry>>(
+          std::make_move_iterator(entries.begin()), std::make_move_iterator(entries.end()))) {}
+
+Dictionary::Dictionary(std::shared_ptr<const std::vector<Entry>> entries)
+    : entries_(std::move(entries)) {}
+
+const Value* Dictionary::find(std::string_view key) const {
+  auto it = std::lower_bound(begin(), end(), key, keyLess);
+  if (it == end() || it->first != key) return nullptr;
+  return &it->second;
+}
+
+Dictionary Dictionary::with(std::string key, Value value) const {
+  auto entries = std::make_shared<std::vector<Entry>>(begin(), end());
+  auto it = std::lower_bound(entries->begin(), entries->end(), key, keyLess);
+  if (it != entries->end() && it->first == key) {
+    it->second = std::move(value);
+  } else {
+    entries->emplace(it, std::move(key), std::move(value));
+  }
+  return Dictionary(std::move(entries));
+}
+
+Dictionary Dictionary::without(std::string_view key) const {
+  auto entries = std::make_shared<std::vector<Entry>>(begin(), end());
+  auto it = std::lower_bound(entries->begin(), entries->end(), key, keyLess);
+  if (it != entries->end() && it->first == key) entries->erase(it);
+  return Dictionary(std::move(entries));
+}
+
+std::map<std::string, Value> Dictionary::toMap() const {
+  return {begin(), end()};
+}
+
+std::size_t Dictionary::size() const {
+  return entries_ ? entries_->size() : 0;
+}
+
+std::vector<Dictionary::Entry>::const_iterator Dictionary::begin() const {
+  return entries_ ? entries_->begin() : emptyEntries().begin();
+}
+
+std::vector<Dictionary::Entry>::const_iterator Dictionary::end() const {
+  return entries_ ? entries_->end() : emptyEntries().end();
+}
+
+bool Dictionary::operator==(const Dictionary& other) const {
+  if (entries_ == other.entries_) return true;
+  return std::equal(begin(), end(), other.begin(), other.end());
+}
+
+}  // namespace value
