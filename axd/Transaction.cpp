@@ -1,0 +1,91 @@
+#include "axd/Transaction.h"
+
+#include <string_view>
+
+#include "Annexa/AXProtocol.h"
+#include "axd/AXDServer.h"
+#include "axd/AXDZynClient.h"
+#include "platform/os/Probes.h"
+
+namespace {
+
+// The request types and their handlers, in the order the type is compared.
+struct Handler {
+  std::string_view type;
+  void (Transaction::*serve)();
+};
+
+constexpr Handler kHandlers[] = {
+    {AXProtocol::kBulk, &Transaction::bulkPlugIns},
+};
+
+}  // namespace
+
+Transaction::Transaction(const zyn::Message& request, std::shared_ptr<AXDZynClient> client)
+    : client_(std::move(client)),
+      request_(request.body.asDictionary() ? *request.body.asDictionary() : value::Dictionary()),
+      reply_(request) {}
+
+const std::shared_ptr<AXDServer>& Transaction::server() const {
+  return client_->server();
+}
+
+std::shared_ptr<zyn::Connection> Transaction::connection() const {
+  return client_->connection();
+}
+
+void Transaction::dispatch() {
+  const value::Value* typeValue = request_.find(AXProtocol::kRequest);
+  const std::string* type = typeValue ? typeValue->asString() : nullptr;
+  version_ = integerField(AXProtocol::kVersion);
+  if (version_ != AXProtocol::kCurrentVersion && version_ != AXProtocol::kPreviousVersion) {
+    fail(AXProtocol::kUnsupportedVersion, os::format("unsupported protocol version %d (current %d)",
+                                                     {version_, AXProtocol::kCurrentVersion}));
+    return;
+  }
+  if (!client_->acceptWork()) return;
+  pid_t pid = client_->pid();
+  const char* typeText = type ? type->c_str() : nullptr;
+  server()->debug("client %d request %s", {pid, typeText});
+  AXD_PROBE_REQUEST(pid, typeText);
+  if (!type) {
+    fail(AXProtocol::kMalformedRequest, "invalid request format (missing type)");
+    return;
+  }
+  for (const Handler& handler : kHandlers) {
+    if (*type == handler.type) {
+      (this->*handler.serve)();
+      return;
+    }
+  }
+  fail(AXProtocol::kMalformedRequest, "unrecognized request");
+}
+
+void Transaction::done() {
+  if (server()->verbose() >= 2) server()->debug("Replying %@", {reply_.body().description()});
+  if (AXD_PROBE_REQUEST_OUTPUT_ENABLED()) {
+    std::string text = reply_.body().description();
+    AXD_PROBE_REQUEST_OUTPUT(client_->pid(), text.c_str());
+  }
+  if (auto connection = this->connection()) connection->send(reply_);
+}
+
+void Transaction::fail(std::int64_t code, const std::optional<std::string>& message) {
+  reply_.set(AXProtocol::kErrorCode,
+             value::Value::unsignedInteger(static_cast<std::uint64_t>(code)));
+  if (message) reply_.set(AXProtocol::kError, value::Value::string(*message));
+  done();
+}
+
+void Transaction::fail(std::int64_t code, const AXError& error) {
+  if (error.domain() == AXErrorDomain) {
+    fail(error.code(), error.localizedDescription());
+  } else {
+    fail(code, error.localizedDescription());
+  }
+}
+
+std::uint64_t Transaction::integerField(const char* key) const {
+  const value::Value* field = request_.find(key);
+  return field && field->asUInt() ? *field->asUInt() : 0;
+}

@@ -1,0 +1,49 @@
+#pragma once
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/os/Error.h"
+#include "platform/value/Dictionary.h"
+
+namespace codesign {
+
+// The entitlement table of a device root: every "<root>/etc/annexa/entitlements.d/*.plist"
+// (hidden files excluded, as the shell's glob does),
+// each a dictionary with "Executable" (absolute path), optionally "SHA256" (the hex digest the
+// executable must have) and "Entitlements" (a dictionary). A file that someone other than root
+// and the daemon's user could have written, and a malformed file, is skipped with a log line
+// naming it. Immutable once loaded; safe to read from several threads at once.
+class EntitlementTable {
+ public:
+  // Reads the table of the current device root (os::Paths::root()), files in name order. A
+  // missing directory is an empty table. Fails with the system's error number only when the
+  // directory exists and cannot be listed; a file that cannot be read is skipped.
+  static os::Result<EntitlementTable> load();
+
+  // The entitlements of the executable at |path| (as /proc/<pid>/exe names it), whose image
+  // can be read through |executableFd| (-1 when it cannot). The first entry in file-name order
+  // whose "Executable" is |path| and, when it has a "SHA256", whose digest equals the image's
+  // wins. An entry without "Entitlements" gives an empty dictionary. Nothing when no entry
+  // matches; a "SHA256" entry never matches without a readable image.
+  std::optional<value::Dictionary> lookup(const std::string& path, int executableFd) const;
+
+  // The number of entries taken from the table files.
+  std::size_t size() const { return entries_.size(); }
+
+ private:
+  struct Entry {
+    std::string source;  // the table file, for log lines
+    std::string executable;
+    std::optional<std::string> sha256;  // lower-case hex
+    value::Dictionary entitlements;
+  };
+
+  static std::optional<Entry> readFile(const std::string& path);
+  static std::optional<Entry> entryFrom(const std::string& path, const value::Value& file);
+
+  std::vector<Entry> entries_;
+};
+
+}  // namespace codesign

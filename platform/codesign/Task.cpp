@@ -1,0 +1,48 @@
+#include "platform/codesign/Task.h"
+
+#include <unistd.h>
+
+#include <cerrno>
+
+#include "platform/codesign/EntitlementTable.h"
+#include "platform/os/Process.h"
+
+namespace codesign {
+
+Task::Task(std::string executablePath, value::Dictionary entitlements,
+           std::optional<os::Error> tableError)
+    : executablePath_(std::move(executablePath)),
+      entitlements_(std::move(entitlements)),
+      tableError_(std::move(tableError)) {}
+
+std::unique_ptr<Task> Task::fromAuditToken(pid_t pid, int pidfd) {
+  auto path = os::Process::executablePath(pid, pidfd);
+  if (!path.ok()) return nullptr;
+  // The digest of a "SHA256" entry is taken from the running image, not from the file now at
+  // the path, so a replaced file is never trusted.
+  auto image = os::Process::openExecutable(pid, pidfd);
+  if (!image.ok() && image.error().errnum == ESRCH) return nullptr;
+  int imageFd = image.ok() ? image.value() : -1;
+  value::Dictionary entitlements;
+  std::optional<os::Error> tableError;
+  auto table = EntitlementTable::load();
+  if (table.ok()) {
+    entitlements = table.value().lookup(path.value(), imageFd).value_or(value::Dictionary());
+  } else {
+    tableError = table.error();
+  }
+  if (imageFd >= 0) close(imageFd);
+  return std::unique_ptr<Task>(
+      new Task(std::move(path).value(), std::move(entitlements), std::move(tableError)));
+}
+
+std::optional<value::Value> Task::entitlementValue(std::string_view key,
+                                                   std::optional<os::Error>* error) const {
+  if (error) *error = tableError_;
+  if (tableError_) return std::nullopt;
+  const value::Value* found = entitlements_.find(key);
+  if (!found) return std::nullopt;
+  return *found;
+}
+
+}  // namespace codesign

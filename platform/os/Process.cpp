@@ -1,0 +1,75 @@
+#include "platform/os/Process.h"
+
+#include <fcntl.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <climits>
+#include <csignal>
+
+// Both numbers are the same on every architecture that has the calls (Linux 5.1 and 5.3).
+#ifndef SYS_pidfd_send_signal
+#define SYS_pidfd_send_signal 424
+#endif
+#ifndef SYS_pidfd_open
+#define SYS_pidfd_open 434
+#endif
+
+namespace os {
+
+namespace {
+
+std::string exeLink(pid_t pid) {
+  return "/proc/" + std::to_string(pid) + "/exe";
+}
+
+Error noPidfd() {
+  return Error{EBADF, "no pidfd to check the process against"};
+}
+
+}  // namespace
+
+Result<int> Process::openPidfd(pid_t pid) {
+  long fd = syscall(SYS_pidfd_open, pid, 0);
+  if (fd < 0) return Error::fromErrno("pidfd_open " + std::to_string(pid));
+  return static_cast<int>(fd);
+}
+
+Status Process::checkAlive(int pidfd) {
+  if (syscall(SYS_pidfd_send_signal, pidfd, 0, nullptr, 0) != 0) {
+    return Error::fromErrno("pidfd_send_signal");
+  }
+  return success();
+}
+
+Result<std::string> Process::executablePath(pid_t pid, int pidfd) {
+  if (pidfd < 0) return noPidfd();
+  std::string link = exeLink(pid);
+  char buffer[PATH_MAX];
+  ssize_t n = readlink(link.c_str(), buffer, sizeof buffer);
+  if (n < 0) return Error::fromErrno("readlink " + link);
+  if (static_cast<std::size_t>(n) == sizeof buffer) {
+    return Error{ENAMETOOLONG, "readlink " + link + ": path too long"};
+  }
+  // Checked after the read: had the process died and its pid been reused before the read, the
+  // pidfd (which names the old process) now reports it gone.
+  Status alive = checkAlive(pidfd);
+  if (!alive.ok()) return alive.error();
+  return std::string(buffer, static_cast<std::size_t>(n));
+}
+
+Result<int> Process::openExecutable(pid_t pid, int pidfd) {
+  if (pidfd < 0) return noPidfd();
+  std::string link = exeLink(pid);
+  int fd = open(link.c_str(), O_RDONLY | O_CLOEXEC);
+  if (fd < 0) return Error::fromErrno("open " + link);
+  Status alive = checkAlive(pidfd);
+  if (!alive.ok()) {
+    close(fd);
+    return alive.error();
+  }
+  return fd;
+}
+
+}  // namespace os

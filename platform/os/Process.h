@@ -1,0 +1,37 @@
+#pragma once
+
+#include <sys/types.h>
+
+#include <string>
+
+#include "platform/os/Error.h"
+
+namespace os {
+
+// Facts about other processes, checked against a pidfd so that a process id the kernel has
+// since given to a new process is never mistaken for the one we mean. Stateless; safe to call
+// from any thread.
+class Process {
+ public:
+  // A new pidfd for process |pid|; the caller owns it and closes it. Fails with ESRCH when no
+  // such process exists, or ENOSYS on a kernel without pidfd_open.
+  static Result<int> openPidfd(pid_t pid);
+
+  // Succeeds while the process that |pidfd| refers to exists (a zombie still does).
+  // Fails with ESRCH when it has been reaped, EBADF when |pidfd| is not a pidfd.
+  static Status checkAlive(int pidfd);
+
+  // The path of |pid|'s executable, from /proc/<pid>/exe, checked afterwards against |pidfd|
+  // (which must refer to |pid|): the answer is the path only if that process was still alive
+  // after the read. Fails with ESRCH when the process is gone (or its pid was reused), EBADF
+  // when |pidfd| is negative, ENOENT for a zombie or kernel thread, EACCES for a process we may
+  // not inspect. A file replaced after the process started reads as "<path> (deleted)".
+  static Result<std::string> executablePath(pid_t pid, int pidfd);
+
+  // A read-only descriptor of the executable image |pid| is running (even when its file was
+  // replaced or removed since), checked against |pidfd| like executablePath(). The caller owns
+  // the descriptor. Fails as executablePath() does.
+  static Result<int> openExecutable(pid_t pid, int pidfd);
+};
+
+}  // namespace os

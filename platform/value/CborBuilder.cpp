@@ -1,0 +1,204 @@
+#include "platform/value/CborBuilder.h"
+
+#include <cstdint>
+
+#include "platform/os/Format.h"
+#include "platform/value/CborCodec.h"
+#include "platform/value/Utf8.h"
+
+namespace value {
+
+const std::string& CborBuilder::error() const {
+  static const std::string kNone;
+  return error_ ? *error_ : kNone;
+}
+
+void CborBuilder::unsignedInteger(std::uint64_t u) {
+  if (!admit(Item::UInt)) return;
+  auto tag = takeTag();
+  if (tag == CborCodec::kTagDate) return deliver(Value::date({static_cast<double>(u)}));
+  if (tag != CborCodec::kTagSignedInteger) return deliver(Value::unsignedInteger(u));
+  if (u > INT64_MAX) return fail(os::format("signed integer %u is out of range", {u}));
+  deliver(Value::integer(static_cast<std::int64_t>(u)));
+}
+
+void CborBuilder::negativeInteger(std::uint64_t n) {
+  if (!admit(Item::NegInt)) return;
+  if (n > INT64_MAX) return fail("negative integer below -2^63 is out of range");
+  std::int64_t i = -1 - static_cast<std::int64_t>(n);
+  if (takeTag() == CborCodec::kTagDate) return deliver(Value::date({static_cast<double>(i)}));
+  deliver(Value::integer(i));
+}
+
+void CborBuilder::real(double d) {
+  if (!admit(Item::Float)) return;
+  if (takeTag() == CborCodec::kTagDate) return deliver(Value::date({d}));
+  deliver(Value::real(d));
+}
+
+void CborBuilder::boolean(bool b) {
+  if (admit(Item::Other)) deliver(Value::boolean(b));
+}
+
+void CborBuilder::null() {
+  if (admit(Item::Other)) deliver(Value());
+}
+
+void CborBuilder::byteString(const std::uint8_t* bytes, std::size_t length) {
+  if (!admit(Item::Bytes)) return;
+  if (!stack_.empty() && stack_.back().kind == Kind::ChunkedBytes) {
+    stack_.back().chunks.append(reinterpret_cast<const char*>(bytes), length);
+    return;
+  }
+  if (takeTag() != CborCodec::kTagUuid) return deliver(Value::data(Data(bytes, bytes + length)));
+  Uuid::Bytes uuid;
+  if (length != uuid.size()) return fail("tag 37 must enclose a 16-byte byte string");
+  std::copy(bytes, bytes + length, uuid.begin());
+  deliver(Value::uuid(Uuid(uuid)));
+}
+
+void CborBuilder::textString(const std::uint8_t* bytes, std::size_t length) {
+  if (!admit(Item::Text)) return;
+  std::string text(reinterpret_cast<const char*>(bytes), length);
+  if (!stack_.empty() && stack_.back().kind == Kind::ChunkedText) {
+    stack_.back().chunks += text;
+    return;
+  }
+  if (!Utf8::valid(text)) return fail("text string is not valid UTF-8");
+  deliver(Value::string(std::move(text)));
+}
+
+void CborBuilder::startChunkedBytes() {
+  if (admit(Item::Other)) stack_.push_back(Open{Kind::ChunkedBytes, true});
+}
+
+void CborBuilder::startChunkedText() {
+  if (admit(Item::Other)) stack_.push_back(Open{Kind::ChunkedText, true});
+}
+
+void CborBuilder::startArray(std::optional<std::uint64_t> count) {
+  if (admit(Item::Other)) startContainer(Kind::Array, count);
+}
+
+void CborBuilder::startMap(std::optional<std::uint64_t> count) {
+  if (!admit(Item::Other)) return;
+  // A map of n pairs holds 2n items, each at least one byte long.
+  if (count && *count > bytesLeft_ / 2) return fail("map declares more entries than the input holds");
+  startContainer(Kind::Map, count ? std::optional(*count * 2) : std::nullopt);
+}
+
+void CborBuilder::tag(std::uint64_t number) {
+  if (!admit(Item::Other)) return;
+  if (number == CborCodec::kTagEnvelope) return startContainer(Kind::Envelope, 1);
+  if (number != CborCodec::kTagDate && number != CborCodec::kTagUuid &&
+      number != CborCodec::kTagSignedInteger) {
+    return fail(os::format("unsupported tag %u", {number}));
+  }
+  pendingTag_ = number;
+}
+
+void CborBuilder::endIndefinite() {
+  if (failed()) return;
+  if (stack_.empty() || !stack_.back().indefinite || pendingTag_ || stack_.back().key) {
+    return fail("unexpected break");
+  }
+  Value value = finish(stack_.back());
+  if (failed()) return;
+  stack_.pop_back();
+  deliver(std::move(value));
+}
+
+void CborBuilder::unsupported(const char* what) {
+  if (!failed()) fail(os::format("%s has no counterpart among values", {what}));
+}
+
+// Whether an item of kind |item| may come next: inside a chunked string only chunks of its own
+// type, and under a pending tag only what that tag encloses.
+bool CborBuilder::admit(Item item) {
+  if (failed()) return false;
+  if (!stack_.empty()) {
+    Kind kind = stack_.back().kind;
+    if ((kind == Kind::ChunkedBytes && item != Item::Bytes) ||
+        (kind == Kind::ChunkedText && item != Item::Text)) {
+      fail("an indefinite-length string holds something other than definite chunks of its type");
+      return false;
+    }
+  }
+  if (!pendingTag_) return true;
+  bool fits = (*pendingTag_ == CborCodec::kTagUuid && item == Item::Bytes) ||
+              (*pendingTag_ == CborCodec::kTagSignedInteger && item == Item::UInt) ||
+              (*pendingTag_ == CborCodec::kTagDate &&
+               (item == Item::UInt || item == Item::NegInt || item == Item::Float));
+  if (!fits) fail(os::format("tag %u encloses an item of the wrong type", {*pendingTag_}));
+  return fits;
+}
+
+std::optional<std::uint64_t> CborBuilder::takeTag() {
+  return std::exchange(pendingTag_, std::nullopt);
+}
+
+void CborBuilder::startContainer(Kind kind, std::optional<std::uint64_t> items) {
+  if (depth_ == maxDepth_) return fail(os::format("items nest deeper than %u", {maxDepth_}));
+  if (items && *items > bytesLeft_) return fail("array declares more elements than the input holds");
+  if (items == 0u) return deliver(kind == Kind::Array ? Value::array({}) : Value::dictionary({}));
+  ++depth_;
+  stack_.push_back(Open{kind, !items, items.value_or(0)});
+}
+
+// Hands a finished item to the innermost open container, closing every container it completes.
+void CborBuilder::deliver(Value value) {
+  while (!stack_.empty()) {
+    if (!add(stack_.back(), std::move(value))) return;
+    value = finish(stack_.back());
+    stack_.pop_back();
+  }
+  result_ = std::move(value);
+}
+
+// Adds |value| to |open|; true when that completes it.
+bool CborBuilder::add(Open& open, Value value) {
+  if (open.kind != Kind::Map) {
+    open.elements.push_back(std::move(value));
+    return open.kind == Kind::Envelope || (!open.indefinite && --open.remaining == 0);
+  }
+  if (!open.key) {
+    const std::string* key = value.asString();
+    if (!key || open.entries.contains(*key)) {
+      fail(key ? "duplicate map key \"" + *key + "\"" : "map key is not a text string");
+      return false;
+    }
+    open.key = *key;
+  } else {
+    open.entries.emplace(std::move(*open.key), std::move(value));
+    open.key.reset();
+  }
+  return !open.indefinite && --open.remaining == 0;
+}
+
+// The value of a complete container or chunked string; records an error for chunked text that
+// is not valid UTF-8.
+Value CborBuilder::finish(Open& open) {
+  switch (open.kind) {
+    case Kind::ChunkedBytes:
+      return Value::data(Data(open.chunks.begin(), open.chunks.end()));
+    case Kind::ChunkedText:
+      if (!Utf8::valid(open.chunks)) fail("text string is not valid UTF-8");
+      return Value::string(std::move(open.chunks));
+    case Kind::Array:
+      --depth_;
+      return Value::array(std::move(open.elements));
+    case Kind::Map:
+      --depth_;
+      return Value::dictionary(Dictionary(std::move(open.entries)));
+    case Kind::Envelope:
+      --depth_;
+      return Value::envelope(std::move(open.elements.front()));
+  }
+  return Value();
+}
+
+void CborBuilder::fail(std::string message) {
+  if (!error_) error_ = std::move(message);
+}
+
+}  // namespace value

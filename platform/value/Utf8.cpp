@@ -1,0 +1,56 @@
+#include "platform/value/Utf8.h"
+
+#include <cstdint>
+
+namespace value {
+
+namespace {
+
+// The length of the well-formed sequence at the start of |text|, or 0 when there is none.
+std::size_t sequenceLength(std::string_view text) {
+  auto byte = [&](std::size_t i) { return static_cast<std::uint8_t>(text[i]); };
+  std::uint8_t lead = byte(0);
+  if (lead < 0x80) return 1;
+  std::size_t length = lead >= 0xF0 ? 4 : lead >= 0xE0 ? 3 : 2;
+  // The bounds of the second byte exclude overlong forms, surrogates and values past U+10FFFF.
+  std::uint8_t low = 0x80, high = 0xBF;
+  if (lead < 0xC2 || lead > 0xF4) return 0;
+  if (lead == 0xE0) low = 0xA0;
+  if (lead == 0xED) high = 0x9F;
+  if (lead == 0xF0) low = 0x90;
+  if (lead == 0xF4) high = 0x8F;
+  if (text.size() < length || byte(1) < low || byte(1) > high) return 0;
+  for (std::size_t i = 2; i < length; ++i) {
+    if ((byte(i) & 0xC0) != 0x80) return 0;
+  }
+  return length;
+}
+
+}  // namespace
+
+bool Utf8::valid(std::string_view text) {
+  while (!text.empty()) {
+    std::size_t length = sequenceLength(text);
+    if (length == 0) return false;
+    text.remove_prefix(length);
+  }
+  return true;
+}
+
+std::string Utf8::repaired(std::string_view text) {
+  std::string out;
+  out.reserve(text.size());
+  while (!text.empty()) {
+    std::size_t length = sequenceLength(text);
+    if (length == 0) {
+      out += "\xEF\xBF\xBD";
+      length = 1;
+    } else {
+      out.append(text.substr(0, length));
+    }
+    text.remove_prefix(length);
+  }
+  return out;
+}
+
+}  // namespace value

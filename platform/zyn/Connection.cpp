@@ -1,0 +1,284 @@
+#include "platform/zyn/Connection.h"
+
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <asio/post.hpp>
+#include <cerrno>
+
+#include "platform/os/Format.h"
+#include "platform/os/Log.h"
+#include "platform/os/Paths.h"
+#include "platform/os/Process.h"
+#include "platform/zyn/Runtime.h"
+
+namespace zyn {
+
+namespace {
+
+constexpr std::size_t kReadChunk = 64 * 1024;
+
+ServiceError invalidError(const std::string& why) {
+  return ServiceError{ErrorKind::ConnectionInvalid, "Connection invalid: " + why};
+}
+
+}  // namespace
+
+std::shared_ptr<Connection> Connection::toService(std::string serviceName,
+                                                  std::shared_ptr<StrandQueue> queue) {
+  asio::local::stream_protocol::socket socket(Runtime::shared().context());
+  return std::shared_ptr<Connection>(new Connection(std::move(socket), PeerCredentials{},
+                                                    std::move(serviceName), std::move(queue)));
+}
+
+std::shared_ptr<Connection> Connection::accepted(asio::local::stream_protocol::socket socket,
+                                                 PeerCredentials peer, std::string serviceName) {
+  auto queue = std::make_shared<StrandQueue>("zyn.connection");
+  return std::shared_ptr<Connection>(
+      new Connection(std::move(socket), peer, std::move(serviceName), std::move(queue)));
+}
+
+Connection::Connection(asio::local::stream_protocol::socket socket, PeerCredentials peer,
+                       std::string serviceName, std::shared_ptr<StrandQueue> queue)
+    : socket_(std::move(socket)),
+      peer_(peer),
+      serviceName_(std::move(serviceName)),
+      queue_(std::move(queue)) {}
+
+Connection::~Connection() {
+  if (peer_.pidfd >= 0) close(peer_.pidfd);
+}
+
+void Connection::setEventHandler(EventHandler handler) {
+  handler_ = std::move(handler);
+}
+
+void Connection::setContext(std::shared_ptr<void> context) {
+  context_ = std::move(context);
+}
+
+void Connection::resume() {
+  if (!socket_.is_open()) connectToService();
+  auto self = shared_from_this();
+  asio::post(Runtime::shared().context(), [self] { self->readMore(); });
+}
+
+void Connection::connectToService() {
+  std::string path = os::Paths::zynSocketDir() + "/" + serviceName_;
+  std::error_code ec;
+  socket_.connect(asio::local::stream_protocol::endpoint(path), ec);
+  if (ec) {
+    std::lock_guard lock(writeMutex_);
+    closed_ = true;
+    connectError_ = os::format("cannot connect to %s: %s", {path, ec.message()});
+  }
+}
+
+void Connection::readMore() {
+  if (!connectError_.empty()) {
+    invalidate(connectError_);
+    return;
+  }
+  auto self = shared_from_this();
+  std::uint8_t* space = decoder_.prepare(kReadChunk);
+  socket_.async_read_some(asio::buffer(space, kReadChunk), [self](std::error_code ec,
+                                                                  std::size_t n) {
+    if (ec) {
+      self->invalidate(ec == asio::error::eof ? "the peer closed the connection" : ec.message());
+      return;
+    }
+    self->decoder_.commit(n);
+    for (;;) {
+      auto next = self->decoder_.next();
+      if (!next.ok()) {
+        os::Log::write(4, os::format("closing connection %@: %s",
+                                     {self->description(), next.error().message}));
+        self->invalidate(next.error().message);
+        return;
+      }
+      if (!next.value()) break;
+      self->received(std::move(*next.value()));
+    }
+    self->readMore();
+  });
+}
+
+void Connection::received(Frame frame) {
+  switch (frame.kind) {
+    case FrameKind::Request:
+    case FrameKind::OneWay:
+      deliver(Message{std::move(frame.body), frame.id, frame.kind == FrameKind::Request});
+      return;
+    case FrameKind::Reply:
+      receivedReply(std::move(frame));
+      return;
+    case FrameKind::Control: {
+      auto* body = frame.body.asDictionary();
+      auto* control = body ? body->find("control") : nullptr;
+      if (control && control->asString() && *control->asString() == "goodbye") {
+        deliver(ServiceError{ErrorKind::TerminationImminent, "Termination imminent"});
+      } else {
+        os::Log::write(4, os::format("ignoring unknown control message %@ on connection %@",
+                                     {frame.body.description(), description()}));
+      }
+      return;
+    }
+  }
+}
+
+void Connection::receivedReply(Frame frame) {
+  ReplyHandler handler;
+  {
+    std::lock_guard lock(pendingMutex_);
+    auto it = pending_.find(frame.id);
+    if (it != pending_.end()) {
+      handler = std::move(it->second);
+      pending_.erase(it);
+    }
+  }
+  if (!handler) {
+    os::Log::write(4, os::format("ignoring reply %llu without a request on connection %@",
+                                 {frame.id, description()}));
+    return;
+  }
+  queue_->dispatch([handler = std::move(handler), body = std::move(frame.body)] { handler(body); });
+}
+
+void Connection::invalidate(std::string why) {
+  {
+    std::lock_guard lock(writeMutex_);
+    closed_ = true;
+    std::error_code ignored;
+    socket_.close(ignored);
+  }
+  std::unordered_map<std::uint64_t, ReplyHandler> pending;
+  {
+    std::lock_guard lock(pendingMutex_);
+    invalid_ = true;
+    pending.swap(pending_);
+  }
+  ServiceError error = invalidError(why);
+  for (auto& entry : pending) {
+    queue_->dispatch([handler = std::move(entry.second), error] { handler(error); });
+  }
+  auto self = shared_from_this();
+  queue_->dispatch([self, error] {
+    if (self->handler_) self->handler_(error);
+    self->handler_ = nullptr;
+  });
+}
+
+void Connection::deliver(Event event) {
+  auto self = shared_from_this();
+  queue_->dispatch([self, event = std::move(event)] {
+    if (self->handler_) self->handler_(event);
+  });
+}
+
+void Connection::send(const Reply& reply) {
+  if (reply.expected()) write(FrameKind::Reply, reply.id(), reply.body());
+}
+
+void Connection::sendMessage(const value::Value& body) {
+  write(FrameKind::OneWay, 0, body);
+}
+
+void Connection::sendWithReply(const value::Value& body, ReplyHandler handler) {
+  std::uint64_t id = nextId_.fetch_add(1, std::memory_order_relaxed);
+  {
+    std::lock_guard lock(pendingMutex_);
+    if (invalid_) {
+      queue_->async([handler = std::move(handler)] { handler(invalidError("closed")); });
+      return;
+    }
+    pending_.emplace(id, std::move(handler));
+  }
+  write(FrameKind::Request, id, body);
+}
+
+void Connection::cancel() {
+  write(FrameKind::Control, 0,
+        value::Value::dictionary({{"control", value::Value::string("goodbye")}}));
+  std::lock_guard lock(writeMutex_);
+  shutdownSocket();
+}
+
+void Connection::write(FrameKind kind, std::uint64_t id, const value::Value& body) {
+  std::vector<std::uint8_t> bytes;
+  encodeFrame(Frame{kind, id, body}, bytes);
+  std::lock_guard lock(writeMutex_);
+  if (closed_) return;
+  std::size_t offset = 0;
+  if (backlog_.empty() && sendNow(bytes, offset)) return;
+  if (backlog_.empty()) backlogOffset_ = offset;
+  backlogBytes_ += bytes.size();
+  backlog_.push_back(std::move(bytes));
+  if (backlogBytes_ > kMaxBacklogBytes) {
+    os::Log::write(4, os::format("disconnecting %@: more than %zu bytes wait to be sent",
+                                 {description(), kMaxBacklogBytes}));
+    shutdownSocket();
+    return;
+  }
+  if (!flushing_) {
+    flushing_ = true;
+    flushLater();
+  }
+}
+
+void Connection::flushLater() {
+  auto self = shared_from_this();
+  asio::post(Runtime::shared().context(), [self] {
+    self->socket_.async_wait(asio::socket_base::wait_write,
+                             [self](std::error_code) { self->flush(); });
+  });
+}
+
+void Connection::flush() {
+  std::lock_guard lock(writeMutex_);
+  while (!closed_ && !backlog_.empty()) {
+    auto& front = backlog_.front();
+    if (!sendNow(front, backlogOffset_)) {
+      flushLater();
+      return;
+    }
+    backlogBytes_ -= front.size();
+    backlog_.pop_front();
+    backlogOffset_ = 0;
+  }
+  flushing_ = false;
+}
+
+bool Connection::sendNow(std::vector<std::uint8_t>& bytes, std::size_t& offset) {
+  while (offset < bytes.size()) {
+    ssize_t n = ::send(socket_.native_handle(), bytes.data() + offset, bytes.size() - offset,
+                       MSG_DONTWAIT | MSG_NOSIGNAL);
+    if (n > 0) {
+      offset += static_cast<std::size_t>(n);
+    } else if (n < 0 && errno == EINTR) {
+      continue;
+    } else if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) {
+      return false;
+    } else {
+      // The peer is gone; the reader sees the end of the stream and invalidates.
+      offset = bytes.size();
+    }
+  }
+  return true;
+}
+
+void Connection::shutdownSocket() {
+  if (!closed_) ::shutdown(socket_.native_handle(), SHUT_RDWR);
+}
+
+std::optional<std::string> Connection::peerExecutablePath() const {
+  auto path = os::Process::executablePath(peer_.pid, peer_.pidfd);
+  if (!path.ok()) return std::nullopt;
+  return path.value();
+}
+
+std::string Connection::description() const {
+  return os::format("<zyn connection %p service=%s pid=%d>",
+                    {static_cast<const void*>(this), serviceName_, peer_.pid});
+}
+
+}  // namespace zyn

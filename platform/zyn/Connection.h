@@ -1,0 +1,127 @@
+#pragma once
+
+#include <sys/types.h>
+
+#include <asio/local/stream_protocol.hpp>
+#include <atomic>
+#include <deque>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <unordered_map>
+#include <vector>
+
+#include "platform/zyn/Frame.h"
+#include "platform/zyn/Message.h"
+#include "platform/zyn/Reply.h"
+#include "platform/zyn/StrandQueue.h"
+
+namespace zyn {
+
+// The identity of the process at the other end of a connection, fixed when it was made.
+struct PeerCredentials {
+  pid_t pid = 0;
+  uid_t uid = static_cast<uid_t>(-1);
+  gid_t gid = static_cast<gid_t>(-1);
+  // A pidfd for the peer: its audit token. -1 when the kernel could give none.
+  int pidfd = -1;
+};
+
+// One connection of the message service, either end. Events (messages and the two terminal
+// errors) are delivered one at a time, in order, on the connection's queue; reply handlers run
+// on the same queue. Sending is safe from any thread and never blocks: what the socket cannot
+// take at once waits in a bounded backlog, and a peer that lets the backlog grow past its bound
+// is disconnected. A connection stays alive while it is resumed and its socket open; the
+// connection-invalid event is its last.
+class Connection : public std::enable_shared_from_this<Connection> {
+ public:
+  using EventHandler = std::function<void(const Event&)>;
+  using ReplyHandler = std::function<void(const ReplyOrError&)>;
+
+  // Bytes of unsent replies and messages beyond which the peer is disconnected.
+  static constexpr std::size_t kMaxBacklogBytes = 64u << 20;
+
+  // A connection to the named service; it connects when resumed. Events and reply handlers run
+  // on |queue|.
+  static std::shared_ptr<Connection> toService(std::string serviceName,
+                                               std::shared_ptr<StrandQueue> queue);
+
+  // The daemon's side of an accepted socket (made by Listener).
+  static std::shared_ptr<Connection> accepted(asio::local::stream_protocol::socket socket,
+                                              PeerCredentials peer, std::string serviceName);
+
+  ~Connection();
+  Connection(const Connection&) = delete;
+  Connection& operator=(const Connection&) = delete;
+
+  // Set before resume(). The handler is dropped after the connection-invalid event.
+  void setEventHandler(EventHandler handler);
+  // An object the connection keeps alive until it is destroyed (its finalizer is the release).
+  void setContext(std::shared_ptr<void> context);
+  const std::shared_ptr<void>& context() const { return context_; }
+
+  // Starts delivering events; a client connection connects first. Call once.
+  void resume();
+
+  // Sends |reply| when its request expected one and the connection still works.
+  void send(const Reply& reply);
+  // Sends a one-way message.
+  void sendMessage(const value::Value& body);
+  // Sends a request; |handler| runs once on the connection's queue with the reply, or with
+  // the connection-invalid error when the connection ends first.
+  void sendWithReply(const value::Value& body, ReplyHandler handler);
+  // Tells the peer that this end is going away (the termination-imminent event on its side)
+  // and closes the connection.
+  void cancel();
+
+  const PeerCredentials& peer() const { return peer_; }
+  pid_t peerPid() const { return peer_.pid; }
+  // The audit token: a pidfd of the peer, or -1.
+  int auditToken() const { return peer_.pidfd; }
+  // The peer's executable path, checked against the audit token; nothing when it cannot be
+  // read or the peer has gone.
+  std::optional<std::string> peerExecutablePath() const;
+
+  std::string description() const;
+
+ private:
+  Connection(asio::local::stream_protocol::socket socket, PeerCredentials peer,
+             std::string serviceName, std::shared_ptr<StrandQueue> queue);
+
+  void connectToService();
+  void readMore();
+  void received(Frame frame);
+  void receivedReply(Frame frame);
+  void invalidate(std::string why);
+  void deliver(Event event);
+  void write(FrameKind kind, std::uint64_t id, const value::Value& body);
+  void flushLater();
+  void flush();
+  bool sendNow(std::vector<std::uint8_t>& bytes, std::size_t& offset);
+  void shutdownSocket();
+
+  asio::local::stream_protocol::socket socket_;
+  const PeerCredentials peer_;
+  const std::string serviceName_;
+  const std::shared_ptr<StrandQueue> queue_;
+  EventHandler handler_;
+  std::shared_ptr<void> context_;
+  FrameDecoder decoder_;
+
+  std::mutex pendingMutex_;  // guards pending_ and invalid_
+  std::unordered_map<std::uint64_t, ReplyHandler> pending_;
+  bool invalid_ = false;
+  std::atomic<std::uint64_t> nextId_{1};
+
+  std::mutex writeMutex_;  // guards the socket's descriptor for writing and everything below
+  std::deque<std::vector<std::uint8_t>> backlog_;
+  std::size_t backlogOffset_ = 0;
+  std::size_t backlogBytes_ = 0;
+  bool flushing_ = false;
+  bool closed_ = false;
+  std::string connectError_;  // written before the first read, then only read
+};
+
+}  // namespace zyn

@@ -1,0 +1,118 @@
+#include "platform/zyn/Frame.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+
+#include "platform/os/Format.h"
+#include "platform/os/Log.h"
+#include "platform/value/CborCodec.h"
+
+namespace zyn {
+
+namespace {
+
+constexpr std::size_t kLengthBytes = 4;
+constexpr std::size_t kHeaderBytes = kLengthBytes + 1 + 8;
+constexpr std::size_t kMinLength = kHeaderBytes - kLengthBytes;
+// A buffer larger than this is given back once it holds nothing, so one large frame does not
+// pin its memory for the life of the connection.
+constexpr std::size_t kKeptCapacity = 1u << 20;
+constexpr std::size_t kMinCapacity = 4096;
+
+void putBigEndian(std::uint8_t* at, std::uint64_t v, std::size_t bytes) {
+  for (std::size_t i = bytes; i-- > 0; v >>= 8) at[i] = static_cast<std::uint8_t>(v);
+}
+
+std::uint64_t getBigEndian(const std::uint8_t* at, std::size_t bytes) {
+  std::uint64_t v = 0;
+  for (std::size_t i = 0; i < bytes; ++i) v = (v << 8) | at[i];
+  return v;
+}
+
+bool knownKind(std::uint8_t kind) {
+  return kind >= static_cast<std::uint8_t>(FrameKind::Request) &&
+         kind <= static_cast<std::uint8_t>(FrameKind::Control);
+}
+
+}  // namespace
+
+void encodeFrame(const Frame& frame, std::vector<std::uint8_t>& out) {
+  std::size_t start = out.size();
+  out.resize(start + kHeaderBytes);
+  out[start + kLengthBytes] = static_cast<std::uint8_t>(frame.kind);
+  putBigEndian(&out[start + kLengthBytes + 1], frame.id, 8);
+  value::CborCodec::encode(frame.body, out);
+  std::size_t length = out.size() - start - kLengthBytes;
+  if (length > UINT32_MAX) {
+    os::Log::write(3, os::format("frame %u of %u bytes exceeds the 4 GiB a frame can carry",
+                                 {frame.id, length}));
+    std::abort();
+  }
+  putBigEndian(&out[start], length, kLengthBytes);
+}
+
+FrameDecoder::FrameDecoder(FrameLimits limits) : limits_(limits) {}
+
+std::uint8_t* FrameDecoder::prepare(std::size_t n) {
+  if (buffer_ && capacity_ - end_ >= n) return buffer_.get() + end_;
+  std::size_t live = buffered();
+  if (buffer_ && capacity_ - live >= n) {
+    std::memmove(buffer_.get(), buffer_.get() + begin_, live);
+  } else {
+    std::size_t capacity = std::max({capacity_ * 2, live + n, kMinCapacity});
+    auto bigger = std::make_unique_for_overwrite<std::uint8_t[]>(capacity);
+    if (live) std::memcpy(bigger.get(), buffer_.get() + begin_, live);
+    buffer_ = std::move(bigger);
+    capacity_ = capacity;
+  }
+  begin_ = 0;
+  end_ = live;
+  return buffer_.get() + end_;
+}
+
+void FrameDecoder::commit(std::size_t n) {
+  end_ = std::min(end_ + n, capacity_);
+}
+
+std::optional<std::uint32_t> FrameDecoder::frameLength() const {
+  if (buffered() < kLengthBytes) return std::nullopt;
+  return static_cast<std::uint32_t>(getBigEndian(buffer_.get() + begin_, kLengthBytes));
+}
+
+os::Result<std::optional<Frame>> FrameDecoder::next() {
+  if (error_) return *error_;
+  auto length = frameLength();
+  if (!length) return std::optional<Frame>();
+  if (*length < kMinLength || *length > limits_.maxFrameBytes) {
+    return broken(EMSGSIZE, os::format("frame length %u is outside 9...%u",
+                                       {*length, limits_.maxFrameBytes}));
+  }
+  const std::uint8_t* frame = buffer_.get() + begin_;
+  if (buffered() > kLengthBytes && !knownKind(frame[kLengthBytes])) {
+    return broken(EBADMSG, os::format("unknown frame kind %u", {frame[kLengthBytes]}));
+  }
+  if (buffered() < kLengthBytes + *length) return std::optional<Frame>();
+  auto kind = static_cast<FrameKind>(frame[kLengthBytes]);
+  std::uint64_t id = getBigEndian(frame + kLengthBytes + 1, 8);
+  auto body = value::CborCodec::decode({frame + kHeaderBytes, *length - kMinLength},
+                                       limits_.maxDepth);
+  if (!body.ok()) return broken(EBADMSG, os::format("frame %u: %s", {id, body.error().message}));
+  begin_ += kLengthBytes + *length;
+  if (begin_ == end_) {
+    begin_ = end_ = 0;
+    if (capacity_ > kKeptCapacity) {
+      buffer_.reset();
+      capacity_ = 0;
+    }
+  }
+  return std::optional<Frame>(Frame{kind, id, std::move(body).value()});
+}
+
+os::Error FrameDecoder::broken(int errnum, std::string message) {
+  error_ = os::Error{errnum, std::move(message)};
+  return *error_;
+}
+
+}  // namespace zyn

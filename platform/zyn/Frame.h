@@ -1,0 +1,73 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <vector>
+
+#include "platform/os/Error.h"
+#include "platform/value/Value.h"
+
+namespace zyn {
+
+// What a frame is for. The numbers are the kind byte on the wire.
+enum class FrameKind : std::uint8_t { Request = 1, Reply = 2, OneWay = 3, Control = 4 };
+
+// One message on a connection: a reply carries its request's id; ids are the sender's choice.
+struct Frame {
+  FrameKind kind;
+  std::uint64_t id;
+  value::Value body;
+};
+
+struct FrameLimits {
+  // Largest length field accepted: the bytes after the 4-byte length (kind, id and item).
+  std::size_t maxFrameBytes = 64u << 20;
+  // Deepest nesting of arrays, maps and envelopes in an item.
+  std::size_t maxDepth = 128;
+};
+
+// Appends the whole encoded frame to |out|: 4-byte big-endian length N of what follows, the kind
+// byte, the 8-byte big-endian id and the CBOR item (N - 9 bytes). The caller keeps bodies under
+// the peer's limit; a body of 4 GiB or more cannot be framed and aborts the process.
+void encodeFrame(const Frame& frame, std::vector<std::uint8_t>& out);
+
+// Incremental decoder over one connection's byte stream: the reader writes into prepare()'s
+// space, commits what it read, then takes frames with next() until it yields nothing. Bytes are
+// decoded where they were read; the buffer is compacted only when space runs out at its end.
+// One per connection; not thread-safe.
+class FrameDecoder {
+ public:
+  explicit FrameDecoder(FrameLimits limits = {});
+
+  FrameDecoder(const FrameDecoder&) = delete;
+  FrameDecoder& operator=(const FrameDecoder&) = delete;
+
+  // Space for at least |n| more bytes, valid until the next call on this decoder. The buffer
+  // grows geometrically and is released when a large frame has been consumed.
+  std::uint8_t* prepare(std::size_t n);
+  // Marks |n| bytes of the last prepare()'s space as read; |n| is at most what was asked for.
+  void commit(std::size_t n);
+
+  // The next complete frame, or nothing when more bytes are needed. An Error when the stream is
+  // broken: a length under 9 or over the limit (errnum EMSGSIZE, reported as soon as the
+  // 4 length bytes are in), an unknown kind, or an item that fails to decode, nests too deeply
+  // or leaves bytes over inside the frame (errnum EBADMSG). After an error every call returns
+  // the same error; the caller closes the stream.
+  os::Result<std::optional<Frame>> next();
+
+ private:
+  std::size_t buffered() const { return end_ - begin_; }
+  // The length field of the frame at the front, when its 4 bytes are in.
+  std::optional<std::uint32_t> frameLength() const;
+  os::Error broken(int errnum, std::string message);
+
+  FrameLimits limits_;
+  std::unique_ptr<std::uint8_t[]> buffer_;
+  std::size_t capacity_ = 0;
+  std::size_t begin_ = 0;  // First unconsumed byte.
+  std::size_t end_ = 0;    // One past the last committed byte.
+  std::optional<os::Error> error_;
+};
+
+}  // namespace zyn

@@ -1,0 +1,162 @@
+#include "platform/zyn/Listener.h"
+
+#include <fcntl.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <asio/post.hpp>
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+
+#include "platform/os/Format.h"
+#include "platform/os/Log.h"
+#include "platform/os/Paths.h"
+#include "platform/os/Process.h"
+#include "platform/zyn/Runtime.h"
+
+namespace zyn {
+
+namespace {
+
+// Debian's kernel headers predate it; the kernel has had it since 6.5.
+constexpr int kSoPeerPidfd = 77;
+constexpr int kFirstInheritedFd = 3;
+
+os::Result<sockaddr_un> socketAddress(const std::string& path) {
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  if (path.size() >= sizeof address.sun_path) {
+    return os::Error{ENAMETOOLONG, "socket path too long: " + path};
+  }
+  std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
+  return address;
+}
+
+bool somebodyListens(const sockaddr_un& address) {
+  int probe = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  if (probe < 0) return false;
+  bool live = connect(probe, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0;
+  close(probe);
+  return live;
+}
+
+PeerCredentials credentialsOf(int fd) {
+  PeerCredentials peer;
+  ucred cred{};
+  socklen_t length = sizeof cred;
+  if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &cred, &length) == 0) {
+    peer.pid = cred.pid;
+    peer.uid = cred.uid;
+    peer.gid = cred.gid;
+  }
+  int pidfd = -1;
+  length = sizeof pidfd;
+  if (getsockopt(fd, SOL_SOCKET, kSoPeerPidfd, &pidfd, &length) == 0 && pidfd >= 0) {
+    peer.pidfd = pidfd;
+  } else if (peer.pid > 0) {
+    auto opened = os::Process::openPidfd(peer.pid);
+    if (opened.ok()) peer.pidfd = opened.value();
+  }
+  return peer;
+}
+
+}  // namespace
+
+os::Result<std::shared_ptr<Listener>> Listener::create(const std::string& serviceName,
+                                                       std::shared_ptr<SerialQueue> queue) {
+  auto inherited = inheritedSocket();
+  if (!inherited.ok()) return inherited.error();
+  std::string path;
+  int fd = inherited.value();
+  if (fd < 0) {
+    path = os::Paths::zynSocketDir() + "/" + serviceName;
+    auto bound = bindSocket(path);
+    if (!bound.ok()) return bound.error();
+    fd = bound.value();
+  }
+  asio::local::stream_protocol::acceptor acceptor(Runtime::shared().context());
+  std::error_code ec;
+  acceptor.assign(asio::local::stream_protocol(), fd, ec);
+  if (ec) {
+    close(fd);
+    return os::Error{ec.value(), "cannot adopt the listening socket: " + ec.message()};
+  }
+  return std::shared_ptr<Listener>(
+      new Listener(std::move(acceptor), serviceName, std::move(path), std::move(queue)));
+}
+
+os::Result<int> Listener::inheritedSocket() {
+  const char* pid = std::getenv("LISTEN_PID");
+  const char* fds = std::getenv("LISTEN_FDS");
+  if (!pid || !fds || std::atol(pid) != getpid() || std::atoi(fds) < 1) return -1;
+  unsetenv("LISTEN_PID");
+  unsetenv("LISTEN_FDS");
+  unsetenv("LISTEN_FDNAMES");
+  int listening = 0;
+  socklen_t length = sizeof listening;
+  if (getsockopt(kFirstInheritedFd, SOL_SOCKET, SO_ACCEPTCONN, &listening, &length) != 0 ||
+      !listening) {
+    return os::Error{ENOTSOCK, "LISTEN_FDS names no listening socket at descriptor 3"};
+  }
+  fcntl(kFirstInheritedFd, F_SETFD, FD_CLOEXEC);
+  return kFirstInheritedFd;
+}
+
+os::Result<int> Listener::bindSocket(const std::string& path) {
+  auto made = os::Paths::ensureDirectory(os::Paths::zynSocketDir(), 0700);
+  if (!made.ok()) return made.error();
+  auto address = socketAddress(path);
+  if (!address.ok()) return address.error();
+  if (somebodyListens(address.value())) {
+    return os::Error{EADDRINUSE, "another process already serves " + path};
+  }
+  unlink(path.c_str());
+  int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  if (fd < 0) return os::Error::fromErrno("socket");
+  const auto* raw = reinterpret_cast<const sockaddr*>(&address.value());
+  if (bind(fd, raw, sizeof address.value()) != 0 || chmod(path.c_str(), 0600) != 0 ||
+      listen(fd, SOMAXCONN) != 0) {
+    os::Error error = os::Error::fromErrno("cannot listen at " + path);
+    close(fd);
+    return error;
+  }
+  return fd;
+}
+
+Listener::Listener(asio::local::stream_protocol::acceptor acceptor, std::string serviceName,
+                   std::string path, std::shared_ptr<SerialQueue> queue)
+    : acceptor_(std::move(acceptor)),
+      serviceName_(std::move(serviceName)),
+      path_(std::move(path)),
+      queue_(std::move(queue)) {}
+
+void Listener::resume() {
+  auto self = shared_from_this();
+  asio::post(Runtime::shared().context(), [self] { self->acceptNext(); });
+}
+
+void Listener::acceptNext() {
+  auto self = shared_from_this();
+  acceptor_.async_accept([self](std::error_code ec, asio::local::stream_protocol::socket socket) {
+    if (ec) {
+      os::Log::write(4, "accept on " + self->serviceName_ + " failed: " + ec.message());
+    } else {
+      self->accepted(std::move(socket));
+    }
+    self->acceptNext();
+  });
+}
+
+void Listener::accepted(asio::local::stream_protocol::socket socket) {
+  PeerCredentials peer = credentialsOf(socket.native_handle());
+  auto connection = Connection::accepted(std::move(socket), peer, serviceName_);
+  auto self = shared_from_this();
+  queue_->async([self, connection] {
+    if (self->handler_) self->handler_(connection);
+  });
+}
+
+}  // namespace zyn

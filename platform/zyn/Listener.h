@@ -1,0 +1,50 @@
+#pragma once
+
+#include <asio/local/stream_protocol.hpp>
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "platform/os/Error.h"
+#include "platform/zyn/Connection.h"
+#include "platform/zyn/SerialQueue.h"
+
+namespace zyn {
+
+// A named service's listening end: a Unix stream socket at <runtime dir>/zyn/<name> (directory
+// 0700, socket 0600), or the listening socket that the service manager handed over through
+// LISTEN_FDS. Each accepted connection is delivered, with its peer's credentials and audit token
+// taken at accept, to the event handler on the listener's queue. Accepting starts at resume().
+class Listener : public std::enable_shared_from_this<Listener> {
+ public:
+  using EventHandler = std::function<void(std::shared_ptr<Connection>)>;
+
+  // Binds the service's socket, or adopts an inherited one. Fails when another live process
+  // serves the name, or the socket cannot be made; a stale socket file is replaced.
+  static os::Result<std::shared_ptr<Listener>> create(const std::string& serviceName,
+                                                      std::shared_ptr<SerialQueue> queue);
+
+  // Set before resume().
+  void setEventHandler(EventHandler handler) { handler_ = std::move(handler); }
+  void resume();
+
+  // The socket's path; empty for an inherited socket.
+  const std::string& path() const { return path_; }
+
+ private:
+  Listener(asio::local::stream_protocol::acceptor acceptor, std::string serviceName,
+           std::string path, std::shared_ptr<SerialQueue> queue);
+
+  static os::Result<int> inheritedSocket();
+  static os::Result<int> bindSocket(const std::string& path);
+  void acceptNext();
+  void accepted(asio::local::stream_protocol::socket socket);
+
+  asio::local::stream_protocol::acceptor acceptor_;
+  const std::string serviceName_;
+  const std::string path_;
+  const std::shared_ptr<SerialQueue> queue_;
+  EventHandler handler_;
+};
+
+}  // namespace zyn

@@ -1,0 +1,205 @@
+#include "platform/value/CborCodec.h"
+
+#include <gtest/gtest.h>
+
+#include <cerrno>
+#include <cmath>
+#include <limits>
+
+namespace {
+
+using value::CborCodec;
+using value::Dictionary;
+using value::Value;
+
+// Bytes from hexadecimal digits; spaces only group them for the reader.
+std::vector<std::uint8_t> fromHex(std::string_view hex) {
+  std::string digits;
+  for (char c : hex) {
+    if (c != ' ') digits += c;
+  }
+  std::vector<std::uint8_t> bytes;
+  for (std::size_t i = 0; i + 1 < digits.size(); i += 2) {
+    bytes.push_back(static_cast<std::uint8_t>(std::stoul(digits.substr(i, 2), nullptr, 16)));
+  }
+  return bytes;
+}
+
+std::string toHex(const std::vector<std::uint8_t>& bytes) {
+  static const char kDigits[] = "0123456789abcdef";
+  std::string hex;
+  for (std::uint8_t b : bytes) {
+    hex += kDigits[b >> 4];
+    hex += kDigits[b & 0xF];
+  }
+  return hex;
+}
+
+std::vector<std::uint8_t> encode(const Value& value) {
+  std::vector<std::uint8_t> out;
+  CborCodec::encode(value, out);
+  return out;
+}
+
+value::Uuid sampleUuid() {
+  return *value::Uuid::parse("00112233-4455-6677-8899-AABBCCDDEEFF");
+}
+
+// Decoding and encoding again must give the same bytes: the encoding tells every type apart
+// (Int from UInt, -0.0 from 0.0, each NaN payload), so equal bytes mean nothing was lost.
+TEST(CborCodecTest, EveryTypeRoundTripsLosslessly) {
+  const double nan = std::numeric_limits<double>::quiet_NaN();
+  const Value values[] = {
+      Value(),
+      Value::boolean(false),
+      Value::integer(INT64_MIN),
+      Value::integer(INT64_MAX),
+      Value::integer(-1),
+      Value::integer(0),
+      Value::unsignedInteger(0),
+      Value::unsignedInteger(UINT64_MAX),
+      Value::real(-0.0),
+      Value::real(nan),
+      Value::real(-std::numeric_limits<double>::infinity()),
+      Value::real(5e-324),
+      Value::string(""),
+      Value::string("gr\xC3\xBC\xC3\x9F \xF0\x9F\x98\x80"),
+      Value::data({}),
+      Value::data({0, 0xFF, 0x80}),
+      Value::date({-1.25}),
+      Value::uuid(sampleUuid()),
+      Value::array({}),
+      Value::dictionary({}),
+      Value::envelope(Value::envelope(Value::array({Value::integer(-7), Value()}))),
+      Value::dictionary({{"", Value::array({Value::dictionary({{"k", Value::real(nan)}})})},
+                         {"uuids", Value::array({Value::uuid(sampleUuid())})}}),
+  };
+  for (const Value& v : values) {
+    std::vector<std::uint8_t> bytes = encode(v);
+    auto decoded = CborCodec::decode(bytes);
+    ASSERT_TRUE(decoded.ok()) << v.description() << ": " << decoded.error().message;
+    EXPECT_EQ(decoded.value().type(), v.type()) << v.description();
+    EXPECT_EQ(toHex(encode(decoded.value())), toHex(bytes)) << v.description();
+  }
+  auto zero = CborCodec::decode(encode(Value::real(-0.0)));
+  EXPECT_TRUE(std::signbit(*zero.value().asReal()));
+  EXPECT_TRUE(std::isnan(*CborCodec::decode(encode(Value::real(nan))).value().asReal()));
+}
+
+TEST(CborCodecTest, EncodingsArePinned) {
+  const std::pair<Value, const char*> cases[] = {
+      {Value::unsignedInteger(5), "05"},
+      {Value::unsignedInteger(UINT64_MAX), "1bffffffffffffffff"},
+      {Value::integer(5), "da41580000 05"},
+      {Value::integer(1000), "da41580000 1903e8"},
+      {Value::integer(-1), "20"},
+      {Value::integer(INT64_MIN), "3b7fffffffffffffff"},
+      {Value::real(1.5), "fb3ff8000000000000"},
+      {Value::boolean(true), "f5"},
+      {Value(), "f6"},
+      {Value::string("a"), "6161"},
+      {Value::data({1, 2}), "420102"},
+      {Value::date({0.5}), "c1 fb3fe0000000000000"},
+      {Value::uuid(sampleUuid()), "d825 50 00112233445566778899aabbccddeeff"},
+      {Value::envelope(Value::unsignedInteger(1)), "da41580001 01"},
+      {Value::dictionary({{"b", Value::unsignedInteger(1)}, {"a", Value::array({})}}),
+       "a2 6161 80 6162 01"},
+      // Text that is not UTF-8 goes out repaired rather than malformed.
+      {Value::string("a\xFF"), "64 61efbfbd"},
+  };
+  for (const auto& [v, hex] : cases) {
+    EXPECT_EQ(toHex(encode(v)), toHex(fromHex(hex))) << v.description();
+  }
+}
+
+TEST(CborCodecTest, OtherWellFormedEncodingsAreAccepted) {
+  const std::pair<const char*, Value> cases[] = {
+      {"f93e00", Value::real(1.5)},
+      {"fa3fc00000", Value::real(1.5)},
+      {"1805", Value::unsignedInteger(5)},
+      {"c1 00", Value::date({0})},
+      {"c1 38ff", Value::date({-256})},
+      {"c1 f93c00", Value::date({1})},
+      {"9f 01 9f ff ff", Value::array({Value::unsignedInteger(1), Value::array({})})},
+      {"bf 6161 01 ff", Value::dictionary({{"a", Value::unsignedInteger(1)}})},
+      {"5f 420102 41 03 40 ff", Value::data({1, 2, 3})},
+      {"7f 6161 62c3a9 ff", Value::string("a\xC3\xA9")},
+  };
+  for (const auto& [hex, expected] : cases) {
+    auto decoded = CborCodec::decode(fromHex(hex));
+    ASSERT_TRUE(decoded.ok()) << hex << ": " << decoded.error().message;
+    EXPECT_EQ(decoded.value(), expected) << hex;
+  }
+}
+
+TEST(CborCodecTest, MalformedOrForeignItemsAreRefused) {
+  const std::pair<const char*, const char*> cases[] = {
+      {"", "ends inside"},
+      {"0500", "follow"},
+      {"6261", "ends inside"},
+      {"8201", "ends inside"},
+      {"5b00000000ffffffff 00", "ends inside"},
+      {"9bffffffffffffffff 00", "more elements"},
+      {"bbffffffffffffffff 00", "more entries"},
+      {"a1 01 02", "not a text string"},
+      {"a2 6161 01 6161 02", "duplicate map key \"a\""},
+      {"c2 4100", "unsupported tag 2"},
+      {"d825 4f 00112233445566778899aabbccddee", "16-byte"},
+      {"d825 6161", "wrong type"},
+      {"d825 5f ff", "wrong type"},  // a UUID is one definite byte string
+      {"da41580000 20", "wrong type"},
+      {"da41580000 1b8000000000000000", "out of range"},
+      {"3b8000000000000000", "out of range"},
+      {"c1 c1 00", "wrong type"},
+      {"c1 6161", "wrong type"},
+      {"f7", "undefined"},
+      {"e0", "initial byte 0xe0"},
+      {"f820", "initial byte 0xf8"},
+      {"1f", "initial byte 0x1f"},
+      {"ff", "unexpected break"},
+      {"bf 6161 ff", "unexpected break"},
+      {"5f 6161 ff", "definite chunks"},
+      {"5f 5f ff ff", "definite chunks"},
+      {"62 c328", "UTF-8"},
+      {"62 c080", "UTF-8"},          // overlong
+      {"63 eda080", "UTF-8"},        // surrogate
+      {"64 f4908080", "UTF-8"},      // past U+10FFFF
+      {"7f 61c3 ff", "UTF-8"},       // chunks that do not add up to UTF-8
+  };
+  for (const auto& [hex, message] : cases) {
+    auto decoded = CborCodec::decode(fromHex(hex));
+    ASSERT_FALSE(decoded.ok()) << hex;
+    EXPECT_EQ(decoded.error().errnum, EBADMSG);
+    EXPECT_NE(decoded.error().message.find(message), std::string::npos)
+        << hex << ": " << decoded.error().message;
+  }
+}
+
+std::vector<std::uint8_t> nestedArrays(std::size_t depth) {
+  std::vector<std::uint8_t> bytes(depth, 0x81);  // arrays of one element
+  bytes.back() = 0x80;                            // the innermost is empty
+  return bytes;
+}
+
+TEST(CborCodecTest, DepthIsLimitedAtExactlyTheLimit) {
+  EXPECT_TRUE(CborCodec::decode(nestedArrays(128)).ok());
+  auto deeper = CborCodec::decode(nestedArrays(129));
+  ASSERT_FALSE(deeper.ok());
+  EXPECT_NE(deeper.error().message.find("deeper than 128"), std::string::npos);
+  // Envelopes and maps count like arrays.
+  EXPECT_TRUE(CborCodec::decode(fromHex("da41580001 a1 6161 80"), 3).ok());
+  EXPECT_FALSE(CborCodec::decode(fromHex("da41580001 a1 6161 81 80"), 3).ok());
+  EXPECT_FALSE(CborCodec::decode(fromHex("9f 9f 9f ff ff ff"), 2).ok());
+}
+
+// Open containers live on the builder's own stack, so even a limit far above any real use
+// cannot overflow the call stack.
+TEST(CborCodecTest, HugeNestingIsRefusedWithoutRecursion) {
+  std::vector<std::uint8_t> bytes(100000, 0x9F);  // indefinite arrays, never closed
+  EXPECT_FALSE(CborCodec::decode(bytes).ok());
+  auto unlimited = CborCodec::decode(bytes, bytes.size() + 1);
+  ASSERT_FALSE(unlimited.ok());
+  EXPECT_NE(unlimited.error().message.find("ends inside"), std::string::npos);
+}
+
+}  // namespace

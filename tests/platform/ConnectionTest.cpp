@@ -1,0 +1,145 @@
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <condition_variable>
+#include <future>
+#include <mutex>
+
+#include "platform/os/Paths.h"
+#include "platform/zyn/Connection.h"
+#include "platform/zyn/Listener.h"
+#include "tests/platform/ScopedEnvironment.h"
+#include "tests/platform/TempDirectory.h"
+
+namespace {
+
+using value::Value;
+
+// A listener on a temporary device root whose connections hand every event to |onEvent|.
+class Service {
+ public:
+  using OnEvent = std::function<void(zyn::Connection&, const zyn::Event&)>;
+
+  explicit Service(OnEvent onEvent) : onEvent_(std::move(onEvent)) {
+    environment_.set("ANNEXA_ROOT", root_.path());
+    auto listener = zyn::Listener::create("test.zyn", std::make_shared<zyn::StrandQueue>("t"));
+    EXPECT_TRUE(listener.ok());
+    listener_ = listener.value();
+    listener_->setEventHandler([this](std::shared_ptr<zyn::Connection> connection) {
+      std::weak_ptr<zyn::Connection> weak = connection;
+      connection->setEventHandler([this, weak](const zyn::Event& event) {
+        if (auto c = weak.lock()) onEvent_(*c, event);
+      });
+      connection->resume();
+      std::lock_guard lock(mutex_);
+      connections_.push_back(std::move(connection));
+    });
+    listener_->resume();
+  }
+
+  std::shared_ptr<zyn::Connection> firstConnection() {
+    std::lock_guard lock(mutex_);
+    return connections_.empty() ? nullptr : connections_.front();
+  }
+
+ private:
+  TempDirectory root_;
+  ScopedEnvironment environment_;
+  OnEvent onEvent_;
+  std::shared_ptr<zyn::Listener> listener_;
+  std::mutex mutex_;
+  std::vector<std::shared_ptr<zyn::Connection>> connections_;
+};
+
+Value numbered(std::int64_t n) {
+  return Value::dictionary({{"n", Value::integer(n)}});
+}
+
+TEST(ConnectionTest, RepliesReachTheRequestTheyAnswerWhateverTheirOrder) {
+  std::mutex mutex;
+  std::vector<zyn::Message> held;
+  Service service([&](zyn::Connection& connection, const zyn::Event& event) {
+    const auto* message = std::get_if<zyn::Message>(&event);
+    if (!message) return;
+    std::lock_guard lock(mutex);
+    held.push_back(*message);
+    if (held.size() < 2) return;
+    for (auto it = held.rbegin(); it != held.rend(); ++it) {
+      zyn::Reply reply(*it);
+      reply.set("echo", *it->body.asDictionary()->find("n"));
+      connection.send(reply);
+    }
+  });
+  auto client = zyn::Connection::toService("test.zyn", std::make_shared<zyn::StrandQueue>("c"));
+  client->setEventHandler([](const zyn::Event&) {});
+  client->resume();
+  std::promise<Value> first, second;
+  client->sendWithReply(numbered(1),
+                        [&](const zyn::ReplyOrError& r) { first.set_value(std::get<Value>(r)); });
+  client->sendWithReply(numbered(2),
+                        [&](const zyn::ReplyOrError& r) { second.set_value(std::get<Value>(r)); });
+  EXPECT_EQ(*first.get_future().get().asDictionary()->find("echo"), Value::integer(1));
+  EXPECT_EQ(*second.get_future().get().asDictionary()->find("echo"), Value::integer(2));
+  client->cancel();
+}
+
+TEST(ConnectionTest, ThePeerIsKnownAndAGoodbyeArrivesBeforeTheEnd) {
+  std::mutex mutex;
+  std::condition_variable changed;
+  std::vector<zyn::ErrorKind> errors;
+  Service service([&](zyn::Connection&, const zyn::Event& event) {
+    if (const auto* error = std::get_if<zyn::ServiceError>(&event)) {
+      std::lock_guard lock(mutex);
+      errors.push_back(error->kind);
+      changed.notify_all();
+    }
+  });
+  auto client = zyn::Connection::toService("test.zyn", std::make_shared<zyn::StrandQueue>("c"));
+  client->resume();
+  client->sendMessage(numbered(0));
+  std::shared_ptr<zyn::Connection> accepted;
+  for (int i = 0; i < 500 && !(accepted = service.firstConnection()); ++i) usleep(10000);
+  ASSERT_TRUE(accepted);
+  EXPECT_EQ(accepted->peerPid(), getpid());
+  EXPECT_GE(accepted->auditToken(), 0);
+  char self[4096];
+  ssize_t n = readlink("/proc/self/exe", self, sizeof self);
+  ASSERT_GT(n, 0);
+  EXPECT_EQ(accepted->peerExecutablePath(), std::string(self, static_cast<std::size_t>(n)));
+
+  client->cancel();
+  std::unique_lock lock(mutex);
+  ASSERT_TRUE(changed.wait_for(lock, std::chrono::seconds(10), [&] { return errors.size() == 2; }));
+  EXPECT_EQ(errors[0], zyn::ErrorKind::TerminationImminent);
+  EXPECT_EQ(errors[1], zyn::ErrorKind::ConnectionInvalid);
+}
+
+TEST(ConnectionTest, APeerThatDoesNotReadIsDisconnectedAtTheBacklogBound) {
+  std::promise<void> invalid;
+  Service service([&](zyn::Connection& connection, const zyn::Event& event) {
+    if (std::holds_alternative<zyn::Message>(event)) {
+      Value chunk = Value::data(value::Data(1 << 20, 0x5a));
+      for (std::size_t i = 0; i <= zyn::Connection::kMaxBacklogBytes >> 20; ++i) {
+        connection.sendMessage(chunk);
+      }
+    } else if (std::get<zyn::ServiceError>(event).kind == zyn::ErrorKind::ConnectionInvalid) {
+      invalid.set_value();
+    }
+  });
+  // A raw client that sends one request and never reads.
+  int fd = socket(AF_UNIX, SOCK_STREAM, 0);
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  std::string path = os::Paths::zynSocketDir() + "/test.zyn";
+  std::snprintf(address.sun_path, sizeof address.sun_path, "%s", path.c_str());
+  ASSERT_EQ(connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+  std::vector<std::uint8_t> frame;
+  zyn::encodeFrame(zyn::Frame{zyn::FrameKind::Request, 1, numbered(1)}, frame);
+  ASSERT_EQ(write(fd, frame.data(), frame.size()), static_cast<ssize_t>(frame.size()));
+  EXPECT_EQ(invalid.get_future().wait_for(std::chrono::seconds(30)), std::future_status::ready);
+  close(fd);
+}
+
+}  // namespace

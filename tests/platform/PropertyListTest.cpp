@@ -1,0 +1,232 @@
+#include "platform/value/PropertyList.h"
+
+#include <gtest/gtest.h>
+#include <plist/plist.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <fstream>
+#include <string>
+
+namespace {
+
+using value::Dictionary;
+using value::PropertyList;
+using value::Value;
+
+std::span<const std::uint8_t> bytesOf(std::string_view text) {
+  return {reinterpret_cast<const std::uint8_t*>(text.data()), text.size()};
+}
+
+std::string xmlPlist(std::string_view body) {
+  return "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<!DOCTYPE plist PUBLIC \"-//Apple//DTD PLIST "
+         "1.0//EN\" \"http://www.apple.com/DTDs/PropertyList-1.0.dtd\">\n<plist version=\"1.0\">" +
+         std::string(body) + "</plist>\n";
+}
+
+std::string repeat(std::string_view s, std::size_t n) {
+  std::string out;
+  for (std::size_t i = 0; i < n; ++i) out += s;
+  return out;
+}
+
+std::string nestedXml(std::size_t depth) {
+  return xmlPlist(repeat("<array>", depth) + repeat("</array>", depth));
+}
+
+// A binary property list written by hand: each object is given as its bytes; references and
+// offsets are 4 bytes wide.
+std::vector<std::uint8_t> binaryPlist(const std::vector<std::vector<std::uint8_t>>& objects) {
+  std::vector<std::uint8_t> out = {'b', 'p', 'l', 'i', 's', 't', '0', '0'};
+  auto put = [&](std::uint64_t v, int width) {
+    for (int i = width - 1; i >= 0; --i) out.push_back(static_cast<std::uint8_t>(v >> (8 * i)));
+  };
+  std::vector<std::uint64_t> offsets;
+  for (const auto& object : objects) {
+    offsets.push_back(out.size());
+    out.insert(out.end(), object.begin(), object.end());
+  }
+  std::uint64_t table = out.size();
+  for (std::uint64_t offset : offsets) put(offset, 4);
+  out.insert(out.end(), {0, 0, 0, 0, 0, 0, 4, 4});
+  put(objects.size(), 8);
+  put(0, 8);
+  put(table, 8);
+  return out;
+}
+
+std::vector<std::uint8_t> arrayOf(std::initializer_list<std::uint32_t> refs) {
+  std::vector<std::uint8_t> object = {static_cast<std::uint8_t>(0xA0 | refs.size())};
+  for (std::uint32_t ref : refs) {
+    for (int i = 3; i >= 0; --i) object.push_back(static_cast<std::uint8_t>(ref >> (8 * i)));
+  }
+  return object;
+}
+
+std::vector<std::uint8_t> toBinary(plist_t root) {
+  char* bin = nullptr;
+  std::uint32_t length = 0;
+  plist_to_bin(root, &bin, &length);
+  std::vector<std::uint8_t> bytes(bin, bin + length);
+  plist_to_bin_free(bin);
+  plist_free(root);
+  return bytes;
+}
+
+TEST(PropertyListTest, XmlReadsEveryType) {
+  auto value = PropertyList::read(bytesOf(xmlPlist(R"(<dict>
+    <key>QFBundleIdentifier</key><string>org.annexa.demo</string>
+    <key>count</key><integer>-5</integer>
+    <key>big</key><integer>18446744073709551615</integer>
+    <key>ratio</key><real>0.5</real>
+    <key>on</key><true/>
+    <key>blob</key><data>AAEC</data>
+    <key>when</key><date>2001-01-01T00:00:10Z</date>
+    <!-- a comment </dict> does not end anything -->
+    <key>list</key><array><string>a &amp; b</string><dict/></array>
+  </dict>)")));
+  ASSERT_TRUE(value.ok()) << value.error().message;
+  Value expected = Value::dictionary({
+      {"QFBundleIdentifier", Value::string("org.annexa.demo")},
+      {"count", Value::integer(-5)},
+      {"big", Value::integer(-1)},
+      {"ratio", Value::real(0.5)},
+      {"on", Value::boolean(true)},
+      {"blob", Value::data({0, 1, 2})},
+      {"when", Value::date({978307210})},
+      {"list", Value::array({Value::string("a & b"), Value::dictionary({})})},
+  });
+  EXPECT_EQ(value.value(), expected);
+  EXPECT_EQ(value.value().asDictionary()->find("count")->type(), value::Type::Int);
+}
+
+TEST(PropertyListTest, BinaryReadsWithDatesConverted) {
+  plist_t root = plist_new_dict();
+  plist_dict_set_item(root, "before", plist_new_date(-1, -500000));  // 1.5 s before 2001
+  plist_dict_set_item(root, "after", plist_new_date(86400, 250000));
+  plist_dict_set_item(root, "n", plist_new_uint(7));
+  plist_dict_set_item(root, "s", plist_new_string("x"));
+  auto value = PropertyList::read(toBinary(root));
+  ASSERT_TRUE(value.ok()) << value.error().message;
+  const Dictionary& d = *value.value().asDictionary();
+  EXPECT_EQ(d.find("before")->asDate()->seconds, 978307198.5);
+  EXPECT_EQ(d.find("after")->asDate()->seconds, 978393600.25);
+  EXPECT_EQ(*d.find("n"), Value::integer(7));
+}
+
+TEST(PropertyListTest, XmlTextReadsBackAsWritten) {
+  Value value = Value::dictionary({
+      {"a", Value::array({Value::integer(INT64_MIN), Value::unsignedInteger(3),
+                          Value::real(-2.5), Value::boolean(false)})},
+      {"d", Value::dictionary({{"data", Value::data({0xFF})}, {"s", Value::string("<&>")}})},
+      {"t", Value::date({0})},
+  });
+  auto xml = PropertyList::toXml(value);
+  ASSERT_TRUE(xml.ok()) << xml.error().message;
+  EXPECT_NE(xml.value().find("<date>1970-01-01T00:00:00Z</date>"), std::string::npos);
+  auto back = PropertyList::read(bytesOf(xml.value()));
+  ASSERT_TRUE(back.ok()) << back.error().message;
+  EXPECT_EQ(back.value(), value);
+}
+
+TEST(PropertyListTest, ValuesWithoutPropertyListFormAreNotWritten) {
+  const Value refused[] = {
+      Value(),
+      Value::uuid(value::Uuid()),
+      Value::envelope(Value::integer(1)),
+      Value::unsignedInteger(UINT64_MAX),
+      Value::array({Value::string(std::string("a\0b", 3))}),
+      Value::dictionary({{std::string("k\0", 2), Value::integer(1)}}),
+      Value::date({1e12}),
+      Value::array({Value::dictionary({{"n", Value()}})}),
+  };
+  for (const Value& v : refused) {
+    auto xml = PropertyList::toXml(v);
+    EXPECT_FALSE(xml.ok()) << v.description();
+    if (!xml.ok()) {
+      EXPECT_EQ(xml.error().errnum, EINVAL);
+    }
+  }
+}
+
+TEST(PropertyListTest, BrokenInputIsRefused) {
+  plist_t uid = plist_new_array();
+  plist_array_append_item(uid, plist_new_uid(3));
+  std::vector<std::uint8_t> truncated = toBinary(plist_new_string("truncated"));
+  truncated.resize(truncated.size() - 5);
+  const std::vector<std::uint8_t> inputs[] = {
+      {},
+      toBinary(uid),
+      truncated,
+      binaryPlist({arrayOf({0})}),       // an array that contains itself
+      binaryPlist({arrayOf({7})}),       // a reference past the objects
+  };
+  for (const auto& bytes : inputs) {
+    auto value = PropertyList::read(bytes);
+    EXPECT_FALSE(value.ok());
+    if (!value.ok()) {
+      EXPECT_EQ(value.error().errnum, EINVAL) << value.error().message;
+    }
+  }
+  for (const char* xml : {"<dict><key>a</key></array>", "<array><string>a</array>", "plain"}) {
+    EXPECT_FALSE(PropertyList::read(bytesOf(xmlPlist(xml))).ok()) << xml;
+  }
+  EXPECT_FALSE(PropertyList::read(bytesOf(xmlPlist("<date>2100-01-01T00:00:00Z</date>"))).ok());
+}
+
+TEST(PropertyListTest, DepthIsLimitedInBothEncodings) {
+  EXPECT_TRUE(PropertyList::read(bytesOf(nestedXml(128))).ok());
+  EXPECT_FALSE(PropertyList::read(bytesOf(nestedXml(129))).ok());
+  // Far deeper than libplist's own recursion survives.
+  EXPECT_FALSE(PropertyList::read(bytesOf(nestedXml(400000))).ok());
+  // Markup hidden in comments may not lower the count.
+  std::string hidden = repeat("<array><!-- </array> -->", 200) + repeat("</array>", 200);
+  EXPECT_FALSE(PropertyList::read(bytesOf(xmlPlist(hidden))).ok());
+
+  auto chain = [](std::uint32_t depth) {
+    std::vector<std::vector<std::uint8_t>> objects;
+    for (std::uint32_t i = 1; i < depth; ++i) objects.push_back(arrayOf({i}));
+    objects.push_back(arrayOf({}));
+    return binaryPlist(objects);
+  };
+  EXPECT_TRUE(PropertyList::read(chain(128)).ok());
+  auto deeper = PropertyList::read(chain(129));
+  ASSERT_FALSE(deeper.ok());
+  EXPECT_NE(deeper.error().message.find("deeper than 128"), std::string::npos);
+  EXPECT_FALSE(PropertyList::read(chain(200000)).ok());
+}
+
+// Object i is an array holding object i + 1 twice: 40 objects would expand to 2^40 values.
+TEST(PropertyListTest, SharedObjectsCannotExpandWithoutBound) {
+  std::vector<std::vector<std::uint8_t>> objects;
+  for (std::uint32_t i = 1; i < 40; ++i) objects.push_back(arrayOf({i, i}));
+  objects.push_back({0x51, 'x'});
+  auto value = PropertyList::read(binaryPlist(objects));
+  ASSERT_FALSE(value.ok());
+  EXPECT_NE(value.error().message.find("expands"), std::string::npos);
+}
+
+TEST(PropertyListTest, FilesAreReadWithTheirPathInErrors) {
+  auto missing = PropertyList::readFile("/nonexistent/Info.plist");
+  ASSERT_FALSE(missing.ok());
+  EXPECT_EQ(missing.error().errnum, ENOENT);
+
+  std::string dir = ::testing::TempDir();
+  std::string good = dir + "/PropertyListTest-good.plist";
+  std::string bad = dir + "/PropertyListTest-bad.plist";
+  std::ofstream(good) << xmlPlist("<dict><key>k</key><integer>1</integer></dict>");
+  std::ofstream(bad) << xmlPlist("<dict><key>k</key>");
+  auto value = PropertyList::readFile(good);
+  ASSERT_TRUE(value.ok()) << value.error().message;
+  EXPECT_EQ(value.value(), Value::dictionary({{"k", Value::integer(1)}}));
+  auto broken = PropertyList::readFile(bad);
+  ASSERT_FALSE(broken.ok());
+  EXPECT_EQ(broken.error().errnum, EINVAL);
+  EXPECT_NE(broken.error().message.find(bad), std::string::npos);
+  EXPECT_EQ(PropertyList::readFile(dir).error().errnum, EISDIR);
+  ::unlink(good.c_str());
+  ::unlink(bad.c_str());
+}
+
+}  // namespace

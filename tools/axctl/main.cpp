@@ -1,0 +1,110 @@
+// axctl: drive the Annexa plug-in daemon from the command line.
+
+#include <CLI/CLI.hpp>
+#include <cstdio>
+
+#include "Annexa/AXProtocol.h"
+#include "tools/axctl/Axctl.h"
+
+namespace {
+
+std::vector<value::Uuid> parseUuids(const std::vector<std::string>& texts) {
+  std::vector<value::Uuid> uuids;
+  for (const auto& text : texts) {
+    auto uuid = value::Uuid::parse(text);
+    if (!uuid) throw CLI::ValidationError("UUID", "not a UUID: " + text);
+    uuids.push_back(*uuid);
+  }
+  return uuids;
+}
+
+// KEY=PATTERN pairs as a rule dictionary of string patterns.
+std::optional<value::Dictionary> parseRule(const std::vector<std::string>& pairs) {
+  if (pairs.empty()) return std::nullopt;
+  std::map<std::string, value::Value> rule;
+  for (const auto& pair : pairs) {
+    auto equals = pair.find('=');
+    if (equals == std::string::npos) throw CLI::ValidationError("RULE", "not KEY=PATTERN: " + pair);
+    rule[pair.substr(0, equals)] = value::Value::string(pair.substr(equals + 1));
+  }
+  return value::Dictionary(std::move(rule));
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  CLI::App app{"axctl: send requests to the Annexa plug-in daemon (axd) and print the replies."};
+  app.require_subcommand(1);
+  Axctl::Options options;
+  app.add_option(
+      "-S,--service", options.serviceName,
+      "service name of the daemon (default: " + AXDaemonClient::defaultServiceName() + ")");
+  app.add_option("--protocol", options.protocolVersion,
+                 "protocol version to send (default 3; the daemon serves 2 and 3)");
+  app.add_flag("--json", options.json, "print the whole reply as JSON");
+
+  std::vector<std::string> paths;
+  std::vector<std::string> uuidTexts;
+  std::vector<std::string> rulePairs;
+  std::uint64_t flags = 0;
+  std::optional<std::int64_t> election;
+  bool apps = false;
+  bool bundles = false;
+
+  auto* add = app.add_subcommand("add", "register the plug-in bundles at PATH...");
+  add->add_option("paths", paths, "absolute paths of plug-in bundles");
+  auto* remove = app.add_subcommand(
+      "remove", "unregister the plug-in bundles at PATH... (needs the manager entitlement)");
+  remove->add_option("paths", paths, "absolute paths of plug-in bundles");
+  auto* bulk = app.add_subcommand("bulk", "send a bulk request (its options are only logged)");
+  bulk->add_option("--flags", flags, "bulk options");
+  auto* match = app.add_subcommand("match", "discover plug-ins matching KEY=PATTERN...");
+  match->add_option("rule", rulePairs, "KEY=PATTERN pairs of the match rule");
+  match->add_option(
+      "--flags", flags,
+      "discovery flags (0x1 all versions, 0x4 all copies, 0x8 system only, 0x200 all)");
+  auto* ready = app.add_subcommand("ready", "make plug-ins launchable for this process");
+  ready->add_option("uuids", uuidTexts, "plug-in UUIDs")->required();
+  ready->add_option("--flags", flags, "ready flags");
+  auto* access = app.add_subcommand("access", "get read-extension tokens for plug-in bundles");
+  access->add_option("uuids", uuidTexts, "plug-in UUIDs")->required();
+  access->add_option("--flags", flags, "access flags");
+  auto* annotate = app.add_subcommand("annotate", "record the user's election of plug-ins");
+  annotate->add_option("uuids", uuidTexts, "plug-in UUIDs")->required();
+  annotate->add_option("--election", election, "the election to store");
+  auto* hold = app.add_subcommand("hold", "hold plug-ins out of use; prints the hold's token");
+  hold->add_option("paths", paths, "application or plug-in bundle paths")->required();
+  auto* holdKind = hold->add_option_group("kind");
+  holdKind->add_flag("--apps", apps,
+                     "each path is an application: hold all its plug-ins (flags 1)");
+  holdKind->add_flag("--bundles", bundles, "each path is one plug-in bundle (flags 2)");
+  holdKind->add_option("--flags", flags, "raw hold flags");
+  holdKind->require_option(1);
+  auto* release = app.add_subcommand("release", "release the hold with token UUID");
+  release->add_option("uuids", uuidTexts, "the hold's token")->required()->expected(1);
+
+  CLI11_PARSE(app, argc, argv);
+
+  try {
+    Axctl axctl(options);
+    if (*add) return axctl.add(paths);
+    if (*remove) return axctl.remove(paths);
+    if (*bulk) return axctl.bulk(flags);
+    if (*match) return axctl.match(parseRule(rulePairs), flags);
+    if (*ready) return axctl.ready(parseUuids(uuidTexts), flags);
+    if (*access) return axctl.access(parseUuids(uuidTexts), flags);
+    if (*annotate) {
+      value::Dictionary annotations;
+      if (election) annotations = annotations.with("election", value::Value::integer(*election));
+      return axctl.annotate(parseUuids(uuidTexts), annotations);
+    }
+    if (*hold) {
+      if (apps) flags = AXProtocol::kHoldApplications;
+      if (bundles) flags = AXProtocol::kHoldPlugIns;
+      return axctl.hold(paths, flags);
+    }
+    return axctl.release(parseUuids(uuidTexts).front());
+  } catch (const CLI::Error& e) {
+    return app.exit(e);
+  }
+}
