@@ -10,7 +10,11 @@ namespace {
 // The user-initiated class: above ordinary work where the system lets us.
 constexpr int kServiceNiceness = -5;
 
-std::shared_ptr<AXDServer> gSharedServer;
+// Never destroyed, like the server it points to.
+std::shared_ptr<AXDServer>& sharedServer() {
+  static auto* server = new std::shared_ptr<AXDServer>();
+  return *server;
+}
 
 }  // namespace
 
@@ -28,7 +32,7 @@ std::shared_ptr<AXDServer> AXDServer::initForService(const char* serviceName,
     return nullptr;
   }
   server->service_ = listener.value();
-  gSharedServer = server;
+  sharedServer() = server;
   std::weak_ptr<AXDServer> weak = server;
   server->service_->setEventHandler([weak](std::shared_ptr<zyn::Connection> connection) {
     if (auto self = weak.lock()) AXDZynClient::initWithConnection(std::move(connection), self);
@@ -42,7 +46,7 @@ void AXDServer::run() {
 }
 
 std::shared_ptr<AXDServer> AXDServer::server() {
-  return gSharedServer;
+  return sharedServer();
 }
 
 void AXDServer::log(int level, std::string_view format,

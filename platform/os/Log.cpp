@@ -25,8 +25,9 @@ struct Sink {
 };
 
 const Sink& sink() {
-  static const Sink kSink;
-  return kSink;
+  // Never destroyed: threads may still log while the process exits.
+  static const Sink* kSink = new Sink();
+  return *kSink;
 }
 
 }  // namespace

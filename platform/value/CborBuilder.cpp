@@ -1,6 +1,8 @@
 #include "platform/value/CborBuilder.h"
 
+#include <algorithm>
 #include <cstdint>
+#include <utility>
 
 #include "platform/os/Format.h"
 #include "platform/value/CborCodec.h"
@@ -83,7 +85,8 @@ void CborBuilder::startArray(std::optional<std::uint64_t> count) {
 void CborBuilder::startMap(std::optional<std::uint64_t> count) {
   if (!admit(Item::Other)) return;
   // A map of n pairs holds 2n items, each at least one byte long.
-  if (count && *count > bytesLeft_ / 2) return fail("map declares more entries than the input holds");
+  if (count && *count > bytesLeft_ / 2)
+    return fail("map declares more entries than the input holds");
   startContainer(Kind::Map, count ? std::optional(*count * 2) : std::nullopt);
 }
 
@@ -139,7 +142,8 @@ std::optional<std::uint64_t> CborBuilder::takeTag() {
 
 void CborBuilder::startContainer(Kind kind, std::optional<std::uint64_t> items) {
   if (depth_ == maxDepth_) return fail(os::format("items nest deeper than %u", {maxDepth_}));
-  if (items && *items > bytesLeft_) return fail("array declares more elements than the input holds");
+  if (items && *items > bytesLeft_)
+    return fail("array declares more elements than the input holds");
   if (items == 0u) return deliver(kind == Kind::Array ? Value::array({}) : Value::dictionary({}));
   ++depth_;
   stack_.push_back(Open{kind, !items, items.value_or(0)});

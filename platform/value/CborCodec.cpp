@@ -23,19 +23,21 @@ void head(Out& out, std::size_t (*encode)(Argument, unsigned char*, std::size_t)
   out.insert(out.end(), bytes, bytes + length);
 }
 
-void text(Out& out, std::string_view s) {
-  if (!Utf8::valid(s)) return text(out, Utf8::repaired(s));
+void textString(Out& out, std::string_view s) {
+  if (!Utf8::valid(s)) return textString(out, Utf8::repaired(s));
   head<std::size_t>(out, cbor_encode_string_start, s.size());
   out.insert(out.end(), s.begin(), s.end());
 }
 
-void bytes(Out& out, const std::uint8_t* data, std::size_t length) {
+void byteString(Out& out, const std::uint8_t* data, std::size_t length) {
   head<std::size_t>(out, cbor_encode_bytestring_start, length);
   out.insert(out.end(), data, data + length);
 }
 
 void integer(Out& out, std::int64_t i) {
-  if (i < 0) return head<std::uint64_t>(out, cbor_encode_negint, static_cast<std::uint64_t>(-(i + 1)));
+  if (i < 0) {
+    return head<std::uint64_t>(out, cbor_encode_negint, static_cast<std::uint64_t>(-(i + 1)));
+  }
   head<std::uint64_t>(out, cbor_encode_tag, CborCodec::kTagSignedInteger);
   head<std::uint64_t>(out, cbor_encode_uint, static_cast<std::uint64_t>(i));
 }
@@ -49,7 +51,7 @@ void container(Out& out, const Value& value) {
   const Dictionary& dictionary = *value.asDictionary();
   head<std::size_t>(out, cbor_encode_map_start, dictionary.size());
   for (const auto& [key, element] : dictionary) {
-    text(out, key);
+    textString(out, key);
     CborCodec::encode(element, out);
   }
 }
@@ -110,15 +112,15 @@ void CborCodec::encode(const Value& value, Out& out) {
     case Type::Real:
       return head<double>(out, cbor_encode_double, *value.asReal());
     case Type::String:
-      return text(out, *value.asString());
+      return textString(out, *value.asString());
     case Type::Data:
-      return bytes(out, value.asData()->data(), value.asData()->size());
+      return byteString(out, value.asData()->data(), value.asData()->size());
     case Type::Date:
       head<std::uint64_t>(out, cbor_encode_tag, kTagDate);
       return head<double>(out, cbor_encode_double, value.asDate()->seconds);
     case Type::Uuid:
       head<std::uint64_t>(out, cbor_encode_tag, kTagUuid);
-      return bytes(out, value.asUuid()->bytes().data(), value.asUuid()->bytes().size());
+      return byteString(out, value.asUuid()->bytes().data(), value.asUuid()->bytes().size());
     case Type::Array:
     case Type::Dictionary:
       return container(out, value);
@@ -135,8 +137,10 @@ os::Result<Value> CborCodec::decode(std::span<const std::uint8_t> bytes, std::si
     std::size_t left = bytes.size() - offset;
     if (left == 0) return malformed("the input ends inside an item", offset);
     builder.setBytesLeft(left);
-    cbor_decoder_result step = cbor_stream_decode(bytes.data() + offset, left, &callbacks(), &builder);
-    if (step.status == CBOR_DECODER_NEDATA) return malformed("the input ends inside an item", offset);
+    cbor_decoder_result step =
+        cbor_stream_decode(bytes.data() + offset, left, &callbacks(), &builder);
+    if (step.status == CBOR_DECODER_NEDATA)
+      return malformed("the input ends inside an item", offset);
     if (step.status == CBOR_DECODER_ERROR) {
       return malformed(os::format("malformed or unsupported initial byte 0x%x", {bytes[offset]}),
                        offset);

@@ -37,6 +37,11 @@ struct Binary {
     return n;
   }
 
+  // The object number that container |object| refers to in place |i|.
+  std::uint64_t reference(const Object& object, std::uint64_t i) const {
+    return number(object.firstRef + i * refSize, refSize);
+  }
+
   // The references of object |index|; nothing when its bytes lie outside the object area.
   std::optional<Object> object(std::uint64_t index) const {
     std::uint64_t offset = number(table + index * offsetSize, offsetSize);
@@ -186,7 +191,7 @@ os::Status PlistGuard::checkBinary(std::span<const std::uint8_t> bytes, std::siz
   std::vector<std::uint64_t> nodes(plist->count, 1);
   std::vector<std::size_t> depth(plist->count, 0);
   std::vector<Visit> stack;
-  // Measures object |index| or opens it for its elements; false when it cannot be read.
+  // Measures object |index| when it is a leaf, or opens it; false when it cannot be read.
   auto enter = [&](std::uint64_t index) {
     auto object = plist->object(index);
     if (!object) return false;
@@ -194,36 +199,33 @@ os::Status PlistGuard::checkBinary(std::span<const std::uint8_t> bytes, std::siz
     if (object->container) stack.push_back(Visit{index, *object});
     return true;
   };
+  // Adds measured object |index| to the innermost open container.
+  auto fold = [&](std::uint64_t index) {
+    Visit& parent = stack.back();
+    parent.nodes = std::min<std::uint64_t>(parent.nodes + nodes[index], maxNodes + 1);
+    parent.depth = std::max(parent.depth, depth[index]);
+  };
   if (!enter(plist->top)) return invalid("binary property list has an object out of range");
   while (!stack.empty()) {
     if (stack.size() > maxDepth) {
       return invalid(os::format("property list nests deeper than %u", {maxDepth}));
     }
-    Visit& visit = stack.back();
+    Visit visit = stack.back();
     if (visit.next == visit.object.refs) {
       nodes[visit.index] = visit.nodes;
       depth[visit.index] = visit.depth + 1;
       state[visit.index] = kDone;
-      std::uint64_t done = visit.index;
       stack.pop_back();
-      if (stack.empty()) break;
-      stack.back().nodes = std::min<std::uint64_t>(stack.back().nodes + nodes[done], maxNodes + 1);
-      stack.back().depth = std::max(stack.back().depth, depth[done]);
+      if (!stack.empty()) fold(visit.index);
       continue;
     }
-    std::uint64_t child = plist->number(visit.object.firstRef + visit.next * plist->refSize,
-                                        plist->refSize);
-    ++visit.next;
+    std::uint64_t child = plist->reference(visit.object, stack.back().next++);
     if (child >= plist->count) return invalid("binary property list refers past its objects");
     if (state[child] == kOpen) return invalid("binary property list contains a reference cycle");
     if (state[child] == kNew && !enter(child)) {
       return invalid("binary property list has an object out of range");
     }
-    if (state[child] == kDone) {
-      Visit& parent = stack.back();
-      parent.nodes = std::min<std::uint64_t>(parent.nodes + nodes[child], maxNodes + 1);
-      parent.depth = std::max(parent.depth, depth[child]);
-    }
+    if (state[child] == kDone) fold(child);
   }
   if (nodes[plist->top] > maxNodes) {
     return invalid(os::format("property list expands to more than %u values", {maxNodes}));
@@ -231,8 +233,7 @@ os::Status PlistGuard::checkBinary(std::span<const std::uint8_t> bytes, std::siz
   return os::success();
 }
 
-os::Status PlistGuard::checkXml(std::string_view text, std::size_t maxDepth,
-                                std::size_t maxNodes) {
+os::Status PlistGuard::checkXml(std::string_view text, std::size_t maxDepth, std::size_t maxNodes) {
   XmlScan scan(text, maxDepth);
   scan.run();
   if (scan.deepest() > maxDepth) {

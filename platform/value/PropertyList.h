@@ -15,8 +15,10 @@ namespace value {
 //
 // Integers read as Int (64 bits, two's complement, so an XML 18446744073709551615 reads as -1).
 // Dates are whole seconds plus microseconds and must lie within 1933...2069 (libplist keeps 32-bit
-// seconds since 2001); XML text carries whole seconds only. UIDs (keyed-archive references) are
-// refused: no file this system reads holds one, and as a bare integer it would lose its meaning.
+// seconds since 2001); XML text carries whole seconds only, and within the one second before 2001
+// a binary date's fraction reads as after it (libplist's accessor drops the sign). UIDs
+// (keyed-archive references) are refused: no file this system reads holds one, and as a bare
+// integer it would lose its meaning.
 class PropertyList {
  public:
   static constexpr std::size_t kMaxDepth = 128;  // Arrays and dictionaries inside one another.

@@ -129,6 +129,7 @@ os::Result<int> Listener::bindSocket(const std::string& path) {
 Listener::Listener(asio::local::stream_protocol::acceptor acceptor, std::string serviceName,
                    std::string path, std::shared_ptr<SerialQueue> queue)
     : acceptor_(std::move(acceptor)),
+      retry_(Runtime::shared().context()),
       serviceName_(std::move(serviceName)),
       path_(std::move(path)),
       queue_(std::move(queue)) {}
@@ -141,12 +142,15 @@ void Listener::resume() {
 void Listener::acceptNext() {
   auto self = shared_from_this();
   acceptor_.async_accept([self](std::error_code ec, asio::local::stream_protocol::socket socket) {
-    if (ec) {
-      os::Log::write(4, "accept on " + self->serviceName_ + " failed: " + ec.message());
-    } else {
+    if (!ec) {
       self->accepted(std::move(socket));
+      self->acceptNext();
+      return;
     }
-    self->acceptNext();
+    // Out of descriptors or memory: retrying at once would only spin, so pause a little.
+    os::Log::write(4, "accept on " + self->serviceName_ + " failed: " + ec.message());
+    self->retry_.expires_after(std::chrono::milliseconds(100));
+    self->retry_.async_wait([self](std::error_code) { self->acceptNext(); });
   });
 }
 

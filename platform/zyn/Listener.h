@@ -1,6 +1,7 @@
 #pragma once
 
 #include <asio/local/stream_protocol.hpp>
+#include <asio/steady_timer.hpp>
 #include <functional>
 #include <memory>
 #include <string>
@@ -41,6 +42,7 @@ class Listener : public std::enable_shared_from_this<Listener> {
   void accepted(asio::local::stream_protocol::socket socket);
 
   asio::local::stream_protocol::acceptor acceptor_;
+  asio::steady_timer retry_;
   const std::string serviceName_;
   const std::string path_;
   const std::shared_ptr<SerialQueue> queue_;

@@ -6,8 +6,8 @@
 namespace zyn {
 
 // The process's message-service runtime: one I/O thread running an event loop on which every
-// connection reads, listeners accept and strand queues run. Created on first use and kept for
-// the life of the process. Safe to use from any thread.
+// connection reads, listeners accept and strand queues run. Created on first use; the thread is
+// stopped when the process exits. Safe to use from any thread.
 class Runtime {
  public:
   static Runtime& shared();
@@ -16,6 +16,9 @@ class Runtime {
 
   // True on the I/O thread.
   bool isCurrent() const { return std::this_thread::get_id() == thread_.get_id(); }
+
+  // Stops the event loop and joins the I/O thread (at exit; nothing runs on it afterwards).
+  void stop();
 
  private:
   Runtime();

@@ -1,21 +1,19 @@
 #pragma once
 
-#include <condition_variable>
-#include <deque>
-#include <memory>
-#include <mutex>
-#include <thread>
+#include <asio/thread_pool.hpp>
+#include <string>
 
 #include "platform/zyn/SerialQueue.h"
 
 namespace zyn {
 
-// A serial queue with a thread of its own. Used where work must never wait behind I/O (the
-// daemon's service queue). Destruction drains the queue and joins the thread.
+// A serial queue with a thread of its own (a one-thread asio pool). Used where work must never
+// wait behind I/O: the daemon's service queue. Destruction runs the work already queued, then
+// joins the thread.
 class ThreadQueue final : public SerialQueue {
  public:
   // |niceness| below 0 asks for a raised priority; it is dropped silently where not permitted.
-  ThreadQueue(std::string label, int niceness = 0);
+  explicit ThreadQueue(std::string label, int niceness = 0);
   ~ThreadQueue() override;
   ThreadQueue(const ThreadQueue&) = delete;
   ThreadQueue& operator=(const ThreadQueue&) = delete;
@@ -25,14 +23,8 @@ class ThreadQueue final : public SerialQueue {
   const std::string& label() const override { return label_; }
 
  private:
-  void run(int niceness);
-
   const std::string label_;
-  std::mutex mutex_;
-  std::condition_variable wake_;
-  std::deque<Work> work_;
-  bool stopping_ = false;
-  std::thread thread_;
+  mutable asio::thread_pool pool_;  // mutable: asking for its executor is not const
 };
 
 }  // namespace zyn

@@ -15,54 +15,56 @@ namespace {
 using value::Value;
 
 // A stand-in daemon on a temporary device root: it records every request and answers each with
-// an empty dictionary.
+// an empty dictionary. Its state is shared with the listener, which outlives the test.
 class FakeDaemon {
  public:
-  FakeDaemon() {
+  FakeDaemon() : state_(std::make_shared<State>()) {
     environment_.set("ANNEXA_ROOT", root_.path());
     auto listener = zyn::Listener::create("test.axd", std::make_shared<zyn::StrandQueue>("test"));
     EXPECT_TRUE(listener.ok());
     listener_ = listener.value();
-    listener_->setEventHandler([this](std::shared_ptr<zyn::Connection> connection) {
+    listener_->setEventHandler([state = state_](std::shared_ptr<zyn::Connection> connection) {
       std::weak_ptr<zyn::Connection> weak = connection;
-      connection->setEventHandler([this, weak](const zyn::Event& event) {
+      connection->setEventHandler([state, weak](const zyn::Event& event) {
         const auto* message = std::get_if<zyn::Message>(&event);
         auto connection = weak.lock();
         if (!message || !connection) return;
-        record(message->body);
+        state->record(message->body);
         connection->send(zyn::Reply(*message));
       });
       connection->resume();
-      std::lock_guard lock(mutex_);
-      connections_.push_back(std::move(connection));
     });
     listener_->resume();
   }
 
   // The next request the daemon received, waiting for it when needed.
   value::Dictionary nextRequest() {
-    std::unique_lock lock(mutex_);
-    arrived_.wait_for(lock, std::chrono::seconds(10), [this] { return !requests_.empty(); });
-    if (requests_.empty()) return {};
-    value::Dictionary request = requests_.front();
-    requests_.erase(requests_.begin());
+    std::unique_lock lock(state_->mutex);
+    state_->arrived.wait_for(lock, std::chrono::seconds(10),
+                             [this] { return !state_->requests.empty(); });
+    if (state_->requests.empty()) return {};
+    value::Dictionary request = state_->requests.front();
+    state_->requests.erase(state_->requests.begin());
     return request;
   }
 
  private:
-  void record(const Value& body) {
-    std::lock_guard lock(mutex_);
-    requests_.push_back(body.asDictionary() ? *body.asDictionary() : value::Dictionary());
-    arrived_.notify_all();
-  }
+  struct State {
+    void record(const Value& body) {
+      std::lock_guard lock(mutex);
+      requests.push_back(body.asDictionary() ? *body.asDictionary() : value::Dictionary());
+      arrived.notify_all();
+    }
+
+    std::mutex mutex;
+    std::condition_variable arrived;
+    std::vector<value::Dictionary> requests;
+  };
 
   TempDirectory root_;
   ScopedEnvironment environment_;
+  std::shared_ptr<State> state_;
   std::shared_ptr<zyn::Listener> listener_;
-  std::mutex mutex_;
-  std::condition_variable arrived_;
-  std::vector<value::Dictionary> requests_;
-  std::vector<std::shared_ptr<zyn::Connection>> connections_;
 };
 
 zyn::ReplyOrError waitFor(const std::function<void(AXDaemonClient::ReplyHandler)>& send) {

@@ -1,10 +1,10 @@
-#include "platform/value/CborCodec.h"
-
 #include <gtest/gtest.h>
 
 #include <cerrno>
 #include <cmath>
 #include <limits>
+
+#include "platform/value/CborCodec.h"
 
 namespace {
 
@@ -161,10 +161,10 @@ TEST(CborCodecTest, MalformedOrForeignItemsAreRefused) {
       {"5f 6161 ff", "definite chunks"},
       {"5f 5f ff ff", "definite chunks"},
       {"62 c328", "UTF-8"},
-      {"62 c080", "UTF-8"},          // overlong
-      {"63 eda080", "UTF-8"},        // surrogate
-      {"64 f4908080", "UTF-8"},      // past U+10FFFF
-      {"7f 61c3 ff", "UTF-8"},       // chunks that do not add up to UTF-8
+      {"62 c080", "UTF-8"},      // overlong
+      {"63 eda080", "UTF-8"},    // surrogate
+      {"64 f4908080", "UTF-8"},  // past U+10FFFF
+      {"7f 61c3 ff", "UTF-8"},   // chunks that do not add up to UTF-8
   };
   for (const auto& [hex, message] : cases) {
     auto decoded = CborCodec::decode(fromHex(hex));
@@ -177,7 +177,7 @@ TEST(CborCodecTest, MalformedOrForeignItemsAreRefused) {
 
 std::vector<std::uint8_t> nestedArrays(std::size_t depth) {
   std::vector<std::uint8_t> bytes(depth, 0x81);  // arrays of one element
-  bytes.back() = 0x80;                            // the innermost is empty
+  bytes.back() = 0x80;                           // the innermost is empty
   return bytes;
 }
 

@@ -17,40 +17,54 @@ namespace {
 
 using value::Value;
 
-// A listener on a temporary device root whose connections hand every event to |onEvent|.
+// A listener on a temporary device root whose connections hand every event to |onEvent|. The
+// handlers share their state with the listener, which outlives the test: events that arrive
+// after the test ended find it still there.
 class Service {
  public:
   using OnEvent = std::function<void(zyn::Connection&, const zyn::Event&)>;
 
-  explicit Service(OnEvent onEvent) : onEvent_(std::move(onEvent)) {
+  explicit Service(OnEvent onEvent) : state_(std::make_shared<State>()) {
+    state_->onEvent = std::move(onEvent);
     environment_.set("ANNEXA_ROOT", root_.path());
     auto listener = zyn::Listener::create("test.zyn", std::make_shared<zyn::StrandQueue>("t"));
     EXPECT_TRUE(listener.ok());
     listener_ = listener.value();
-    listener_->setEventHandler([this](std::shared_ptr<zyn::Connection> connection) {
+    listener_->setEventHandler([state = state_](std::shared_ptr<zyn::Connection> connection) {
       std::weak_ptr<zyn::Connection> weak = connection;
-      connection->setEventHandler([this, weak](const zyn::Event& event) {
-        if (auto c = weak.lock()) onEvent_(*c, event);
+      connection->setEventHandler([state, weak](const zyn::Event& event) {
+        auto c = weak.lock();
+        std::lock_guard lock(state->mutex);
+        if (c && state->onEvent) state->onEvent(*c, event);
       });
       connection->resume();
-      std::lock_guard lock(mutex_);
-      connections_.push_back(std::move(connection));
+      std::lock_guard lock(state->mutex);
+      state->connections.push_back(std::move(connection));
     });
     listener_->resume();
   }
 
+  ~Service() {
+    std::lock_guard lock(state_->mutex);
+    state_->onEvent = nullptr;
+  }
+
   std::shared_ptr<zyn::Connection> firstConnection() {
-    std::lock_guard lock(mutex_);
-    return connections_.empty() ? nullptr : connections_.front();
+    std::lock_guard lock(state_->mutex);
+    return state_->connections.empty() ? nullptr : state_->connections.front();
   }
 
  private:
+  struct State {
+    std::mutex mutex;
+    OnEvent onEvent;
+    std::vector<std::shared_ptr<zyn::Connection>> connections;
+  };
+
   TempDirectory root_;
   ScopedEnvironment environment_;
-  OnEvent onEvent_;
+  std::shared_ptr<State> state_;
   std::shared_ptr<zyn::Listener> listener_;
-  std::mutex mutex_;
-  std::vector<std::shared_ptr<zyn::Connection>> connections_;
 };
 
 Value numbered(std::int64_t n) {

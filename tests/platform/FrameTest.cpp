@@ -1,9 +1,9 @@
-#include "platform/zyn/Frame.h"
-
 #include <gtest/gtest.h>
 
 #include <cerrno>
 #include <cstring>
+
+#include "platform/zyn/Frame.h"
 
 namespace {
 
@@ -49,9 +49,19 @@ void expectSame(const Frame& a, const Frame& b) {
 }
 
 std::vector<std::uint8_t> header(std::uint32_t length, std::uint8_t kind) {
-  return {static_cast<std::uint8_t>(length >> 24), static_cast<std::uint8_t>(length >> 16),
-          static_cast<std::uint8_t>(length >> 8), static_cast<std::uint8_t>(length), kind,
-          0, 0, 0, 0, 0, 0, 0, 7};
+  return {static_cast<std::uint8_t>(length >> 24),
+          static_cast<std::uint8_t>(length >> 16),
+          static_cast<std::uint8_t>(length >> 8),
+          static_cast<std::uint8_t>(length),
+          kind,
+          0,
+          0,
+          0,
+          0,
+          0,
+          0,
+          0,
+          7};
 }
 
 os::Error errorAfter(const std::vector<std::uint8_t>& bytes, zyn::FrameLimits limits = {}) {

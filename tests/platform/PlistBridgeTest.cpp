@@ -1,6 +1,6 @@
-#include "platform/value/PlistBridge.h"
-
 #include <gtest/gtest.h>
+
+#include "platform/value/PlistBridge.h"
 
 namespace {
 

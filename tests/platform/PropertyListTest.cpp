@@ -1,5 +1,3 @@
-#include "platform/value/PropertyList.h"
-
 #include <gtest/gtest.h>
 #include <plist/plist.h>
 #include <unistd.h>
@@ -8,6 +6,8 @@
 #include <cstdlib>
 #include <fstream>
 #include <string>
+
+#include "platform/value/PropertyList.h"
 
 namespace {
 
@@ -117,8 +117,8 @@ TEST(PropertyListTest, BinaryReadsWithDatesConverted) {
 
 TEST(PropertyListTest, XmlTextReadsBackAsWritten) {
   Value value = Value::dictionary({
-      {"a", Value::array({Value::integer(INT64_MIN), Value::unsignedInteger(3),
-                          Value::real(-2.5), Value::boolean(false)})},
+      {"a", Value::array({Value::integer(INT64_MIN), Value::unsignedInteger(3), Value::real(-2.5),
+                          Value::boolean(false)})},
       {"d", Value::dictionary({{"data", Value::data({0xFF})}, {"s", Value::string("<&>")}})},
       {"t", Value::date({0})},
   });
@@ -159,8 +159,8 @@ TEST(PropertyListTest, BrokenInputIsRefused) {
       {},
       toBinary(uid),
       truncated,
-      binaryPlist({arrayOf({0})}),       // an array that contains itself
-      binaryPlist({arrayOf({7})}),       // a reference past the objects
+      binaryPlist({arrayOf({0})}),  // an array that contains itself
+      binaryPlist({arrayOf({7})}),  // a reference past the objects
   };
   for (const auto& bytes : inputs) {
     auto value = PropertyList::read(bytes);
