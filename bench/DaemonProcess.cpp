@@ -1,0 +1,115 @@
+#include "bench/DaemonProcess.h"
+
+#include <signal.h>
+#include <spawn.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <thread>
+
+#include "Annexa/AXDaemonClient.h"
+#include "platform/os/Paths.h"
+
+namespace {
+
+constexpr auto kPollInterval = std::chrono::milliseconds(10);
+constexpr int kPollsBeforeKill = 500;
+
+std::optional<std::string> environmentRoot() {
+  const char* root = std::getenv("ANNEXA_ROOT");
+  return root ? std::optional<std::string>(root) : std::nullopt;
+}
+
+// True when a listener has taken the socket: the file alone appears before listen().
+bool accepts(const std::string& path) {
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  if (path.size() >= sizeof address.sun_path) return false;
+  std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
+  int probe = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  if (probe < 0) return false;
+  bool live = connect(probe, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0;
+  close(probe);
+  return live;
+}
+
+std::string describeExit(int status) {
+  if (WIFSIGNALED(status)) return "killed by signal " + std::to_string(WTERMSIG(status));
+  return "exit status " + std::to_string(WEXITSTATUS(status));
+}
+
+}  // namespace
+
+os::Result<std::unique_ptr<DaemonProcess>> DaemonProcess::start(
+    const std::string& executable, std::chrono::milliseconds timeout) {
+  char pattern[] = "/tmp/axd-bench-XXXXXX";
+  if (!mkdtemp(pattern)) return os::Error::fromErrno("mkdtemp");
+  std::unique_ptr<DaemonProcess> daemon(new DaemonProcess(pattern));
+  os::Status started = daemon->spawn(executable);
+  if (!started.ok()) return started.error();
+  os::Status listening = daemon->waitUntilListening(timeout);
+  if (!listening.ok()) return os::Error{listening.error().errnum,
+                                        executable + ": " + listening.error().message};
+  return daemon;
+}
+
+DaemonProcess::DaemonProcess(std::string root)
+    : root_(std::move(root)), previousRoot_(environmentRoot()) {
+  setenv("ANNEXA_ROOT", root_.c_str(), 1);
+}
+
+DaemonProcess::~DaemonProcess() {
+  stop();
+  if (previousRoot_) {
+    setenv("ANNEXA_ROOT", previousRoot_->c_str(), 1);
+  } else {
+    unsetenv("ANNEXA_ROOT");
+  }
+  std::error_code ignored;
+  std::filesystem::remove_all(root_, ignored);
+}
+
+std::string DaemonProcess::socketPath() {
+  return os::Paths::zynSocketDir() + "/" + AXDaemonClient::defaultServiceName();
+}
+
+os::Status DaemonProcess::spawn(const std::string& executable) {
+  char* argv[] = {const_cast<char*>(executable.c_str()), nullptr};
+  int failed = posix_spawn(&pid_, executable.c_str(), nullptr, nullptr, argv, environ);
+  if (failed == 0) return os::success();
+  pid_ = 0;
+  return os::Error{failed, "cannot start " + executable + ": " + std::strerror(failed)};
+}
+
+os::Status DaemonProcess::waitUntilListening(std::chrono::milliseconds timeout) {
+  const std::string path = socketPath();
+  const auto deadline = std::chrono::steady_clock::now() + timeout;
+  while (!accepts(path)) {
+    int status = 0;
+    if (waitpid(pid_, &status, WNOHANG) == pid_) {
+      pid_ = 0;
+      return os::Error{ECHILD, "exited before listening (" + describeExit(status) + ")"};
+    }
+    if (std::chrono::steady_clock::now() >= deadline) {
+      return os::Error{ETIMEDOUT, "no listener at " + path + " in time"};
+    }
+    std::this_thread::sleep_for(kPollInterval);
+  }
+  return os::success();
+}
+
+void DaemonProcess::stop() {
+  if (pid_ <= 0) return;
+  kill(pid_, SIGTERM);
+  for (int i = 0; i < kPollsBeforeKill; ++i) {
+    if (waitpid(pid_, nullptr, WNOHANG) == pid_) return;
+    std::this_thread::sleep_for(kPollInterval);
+  }
+  kill(pid_, SIGKILL);
+  waitpid(pid_, nullptr, 0);
+}
