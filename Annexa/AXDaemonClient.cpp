@@ -53,6 +53,15 @@ AXDaemonClient::Request AXDaemonClient::request(const char* type,
   return r;
 }
 
+AXDaemonClient::Request AXDaemonClient::request(const char* type,
+                                                const std::vector<value::Uuid>& uuids,
+                                                std::uint64_t flags) const {
+  Request r = request(type);
+  r[AXProtocol::kFlags] = Value::unsignedInteger(flags);
+  set(r, uuids);
+  return r;
+}
+
 void AXDaemonClient::set(Request& request, const std::vector<value::Uuid>& uuids) {
   value::Array array;
   array.reserve(uuids.size());
@@ -80,18 +89,12 @@ void AXDaemonClient::bulkPlugins(std::uint64_t flags, ReplyHandler reply) {
 
 void AXDaemonClient::readyPlugIns(const std::vector<value::Uuid>& uuids, std::uint64_t flags,
                                   ReplyHandler reply) {
-  Request r = request(AXProtocol::kReady);
-  r[AXProtocol::kFlags] = Value::unsignedInteger(flags);
-  set(r, uuids);
-  send(r, std::move(reply));
+  send(request(AXProtocol::kReady, uuids, flags), std::move(reply));
 }
 
 void AXDaemonClient::accessPlugIns(const std::vector<value::Uuid>& uuids, std::uint64_t flags,
                                    ReplyHandler reply) {
-  Request r = request(AXProtocol::kAccess);
-  r[AXProtocol::kFlags] = Value::unsignedInteger(flags);
-  set(r, uuids);
-  send(r, std::move(reply));
+  send(request(AXProtocol::kAccess, uuids, flags), std::move(reply));
 }
 
 void AXDaemonClient::matchPlugIns(const std::optional<value::Dictionary>& rule, std::uint64_t flags,

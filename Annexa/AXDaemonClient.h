@@ -38,6 +38,9 @@ class AXDaemonClient {
   // A new request of |type| holding "request" and "version".
   Request request(const char* type) const;
   Request request(const char* type, const std::vector<std::string>& paths) const;
+  // A request of |type| with "flags" and "uuids".
+  Request request(const char* type, const std::vector<value::Uuid>& uuids,
+                  std::uint64_t flags) const;
   static void set(Request& request, const std::vector<value::Uuid>& uuids);
   void send(const Request& request, ReplyHandler reply);
 
