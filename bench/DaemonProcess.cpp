@@ -45,16 +45,16 @@ std::string describeExit(int status) {
 
 }  // namespace
 
-os::Result<std::unique_ptr<DaemonProcess>> DaemonProcess::start(
-    const std::string& executable, std::chrono::milliseconds timeout) {
+os::Result<std::unique_ptr<DaemonProcess>> DaemonProcess::start(const std::string& executable,
+                                                                std::chrono::milliseconds timeout) {
   char pattern[] = "/tmp/axd-bench-XXXXXX";
   if (!mkdtemp(pattern)) return os::Error::fromErrno("mkdtemp");
   std::unique_ptr<DaemonProcess> daemon(new DaemonProcess(pattern));
   os::Status started = daemon->spawn(executable);
   if (!started.ok()) return started.error();
   os::Status listening = daemon->waitUntilListening(timeout);
-  if (!listening.ok()) return os::Error{listening.error().errnum,
-                                        executable + ": " + listening.error().message};
+  if (!listening.ok())
+    return os::Error{listening.error().errnum, executable + ": " + listening.error().message};
   return daemon;
 }
 

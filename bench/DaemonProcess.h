@@ -19,8 +19,7 @@ class DaemonProcess {
   // connections. Fails when the root cannot be made, the program cannot be started or exits
   // first, or the socket does not accept in time; nothing is left running then.
   static os::Result<std::unique_ptr<DaemonProcess>> start(
-      const std::string& executable,
-      std::chrono::milliseconds timeout = std::chrono::seconds(10));
+      const std::string& executable, std::chrono::milliseconds timeout = std::chrono::seconds(10));
   ~DaemonProcess();
   DaemonProcess(const DaemonProcess&) = delete;
   DaemonProcess& operator=(const DaemonProcess&) = delete;

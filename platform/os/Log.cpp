@@ -3,7 +3,9 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cerrno>
+#include <chrono>
 #include <cstdlib>
 #include <cstring>
 #include <string>
@@ -24,6 +26,19 @@ struct Sink {
   }
 };
 
+// Without a log daemon, glibc's syslog() tries to reconnect to /dev/log on every call, which
+// costs more than serving a request. So look for the socket at most once a second and skip
+// syslog() while it is missing.
+bool syslogListens() {
+  static std::atomic<std::int64_t> checkedAt{-1};
+  static std::atomic<bool> present{false};
+  auto now = std::chrono::duration_cast<std::chrono::seconds>(
+                 std::chrono::steady_clock::now().time_since_epoch())
+                 .count();
+  if (checkedAt.exchange(now) != now) present.store(access("/dev/log", W_OK) == 0);
+  return present.load();
+}
+
 const Sink& sink() {
   // Never destroyed: threads may still log while the process exits.
   static const Sink* kSink = new Sink();
@@ -34,7 +49,7 @@ const Sink& sink() {
 
 void Log::write(int level, std::string_view message) {
   const Sink& s = sink();
-  syslog(level, "%.*s", static_cast<int>(message.size()), message.data());
+  if (syslogListens()) syslog(level, "%.*s", static_cast<int>(message.size()), message.data());
   if (!s.toStderr) return;
   std::string line = s.prefix;
   line.append(message);
