@@ -9,7 +9,7 @@
 #include <cstring>
 
 #include "bench/BulkFrames.h"
-#include "bench/DaemonProcess.h"
+#include "tests/support/DaemonProcess.h"
 
 namespace {
 

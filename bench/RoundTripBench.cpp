@@ -11,7 +11,7 @@
 
 #include "Annexa/AXDaemonClient.h"
 #include "bench/BulkFrames.h"
-#include "bench/DaemonProcess.h"
+#include "tests/support/DaemonProcess.h"
 #include "bench/EchoServer.h"
 
 namespace {

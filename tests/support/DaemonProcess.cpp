@@ -1,5 +1,6 @@
-#include "bench/DaemonProcess.h"
+#include "tests/support/DaemonProcess.h"
 
+#include <fcntl.h>
 #include <signal.h>
 #include <spawn.h>
 #include <sys/socket.h>
@@ -10,6 +11,8 @@
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
+#include <fstream>
+#include <sstream>
 #include <thread>
 
 #include "Annexa/AXDaemonClient.h"
@@ -46,10 +49,11 @@ std::string describeExit(int status) {
 }  // namespace
 
 os::Result<std::unique_ptr<DaemonProcess>> DaemonProcess::start(const std::string& executable,
+                                                                const Options& options,
                                                                 std::chrono::milliseconds timeout) {
-  char pattern[] = "/tmp/axd-bench-XXXXXX";
+  char pattern[] = "/tmp/axd-root-XXXXXX";
   if (!mkdtemp(pattern)) return os::Error::fromErrno("mkdtemp");
-  std::unique_ptr<DaemonProcess> daemon(new DaemonProcess(pattern));
+  std::unique_ptr<DaemonProcess> daemon(new DaemonProcess(pattern, options));
   os::Status started = daemon->spawn(executable);
   if (!started.ok()) return started.error();
   os::Status listening = daemon->waitUntilListening(timeout);
@@ -58,8 +62,8 @@ os::Result<std::unique_ptr<DaemonProcess>> DaemonProcess::start(const std::strin
   return daemon;
 }
 
-DaemonProcess::DaemonProcess(std::string root)
-    : root_(std::move(root)), previousRoot_(environmentRoot()) {
+DaemonProcess::DaemonProcess(std::string root, Options options)
+    : root_(std::move(root)), options_(std::move(options)), previousRoot_(environmentRoot()) {
   setenv("ANNEXA_ROOT", root_.c_str(), 1);
 }
 
@@ -78,16 +82,64 @@ std::string DaemonProcess::socketPath() {
   return os::Paths::zynSocketDir() + "/" + AXDaemonClient::defaultServiceName();
 }
 
+std::string DaemonProcess::servicePath() const {
+  if (options_.serviceName.empty()) return socketPath();
+  return os::Paths::zynSocketDir() + "/" + options_.serviceName;
+}
+
 os::Status DaemonProcess::spawn(const std::string& executable) {
-  char* argv[] = {const_cast<char*>(executable.c_str()), nullptr};
-  int failed = posix_spawn(&pid_, executable.c_str(), nullptr, nullptr, argv, environ);
+  std::vector<std::string> words{executable};
+  words.insert(words.end(), options_.arguments.begin(), options_.arguments.end());
+  std::vector<char*> argv;
+  for (auto& word : words) argv.push_back(word.data());
+  argv.push_back(nullptr);
+  std::vector<std::string> settings;
+  for (char** variable = environ; *variable; ++variable) {
+    if (std::strncmp(*variable, "AXD_LOG=", 8) != 0) settings.emplace_back(*variable);
+  }
+  posix_spawn_file_actions_t actions;
+  posix_spawn_file_actions_init(&actions);
+  if (options_.captureLog) {
+    settings.emplace_back("AXD_LOG=stderr");
+    std::string log = root_ + "/axd.log";
+    posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, log.c_str(),
+                                     O_WRONLY | O_CREAT | O_APPEND, 0644);
+  }
+  std::vector<char*> envp;
+  for (auto& setting : settings) envp.push_back(setting.data());
+  envp.push_back(nullptr);
+  int failed = posix_spawn(&pid_, executable.c_str(), &actions, nullptr, argv.data(), envp.data());
+  posix_spawn_file_actions_destroy(&actions);
   if (failed == 0) return os::success();
   pid_ = 0;
   return os::Error{failed, "cannot start " + executable + ": " + std::strerror(failed)};
 }
 
+bool DaemonProcess::running() {
+  if (pid_ <= 0) return false;
+  if (waitpid(pid_, nullptr, WNOHANG) != pid_) return true;
+  pid_ = 0;
+  return false;
+}
+
+std::string DaemonProcess::log() const {
+  std::ifstream file(root_ + "/axd.log");
+  std::stringstream text;
+  text << file.rdbuf();
+  return text.str();
+}
+
+bool DaemonProcess::waitForLog(const std::string& text, std::chrono::milliseconds timeout) const {
+  const auto deadline = std::chrono::steady_clock::now() + timeout;
+  while (log().find(text) == std::string::npos) {
+    if (std::chrono::steady_clock::now() >= deadline) return false;
+    std::this_thread::sleep_for(kPollInterval);
+  }
+  return true;
+}
+
 os::Status DaemonProcess::waitUntilListening(std::chrono::milliseconds timeout) {
-  const std::string path = socketPath();
+  const std::string path = servicePath();
   const auto deadline = std::chrono::steady_clock::now() + timeout;
   while (!accepts(path)) {
     int status = 0;
