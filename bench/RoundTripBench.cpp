@@ -11,8 +11,8 @@
 
 #include "Annexa/AXDaemonClient.h"
 #include "bench/BulkFrames.h"
-#include "tests/support/DaemonProcess.h"
 #include "bench/EchoServer.h"
+#include "tests/support/DaemonProcess.h"
 
 namespace {
 

@@ -16,10 +16,16 @@ ThreadQueue::ThreadQueue(std::string label, int niceness) : label_(std::move(lab
   });
 }
 
-ThreadQueue::~ThreadQueue() { pool_.join(); }
+ThreadQueue::~ThreadQueue() {
+  pool_.join();
+}
 
-void ThreadQueue::async(Work work) { asio::post(pool_, std::move(work)); }
+void ThreadQueue::async(Work work) {
+  asio::post(pool_, std::move(work));
+}
 
-bool ThreadQueue::isCurrent() const { return pool_.get_executor().running_in_this_thread(); }
+bool ThreadQueue::isCurrent() const {
+  return pool_.get_executor().running_in_this_thread();
+}
 
 }  // namespace zyn

@@ -1,0 +1,102 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "Annexa/AXError.h"
+#include "Annexa/AXPlugInCore.h"
+#include "platform/registrum/PlugInRecord.h"
+#include "platform/value/Dictionary.h"
+#include "platform/value/Value.h"
+
+// The daemon's plug-in record: an AXPlugInCore built from the application registry's record of
+// an installed plug-in (its "rgproxy"), answering every manifest question through that record.
+//
+// Thread safety: as AXPlugInCore. A record is built by initWithRGData on one thread and then
+// read from any queue; rgproxy is set once before the record is shared and never changes. The
+// display-name caches are the base record's fields (guarded by its lock): two first readers may
+// both fetch the same registry value and both store it, which is harmless.
+class AXDPlugIn : public AXPlugInCore {
+ public:
+  // The record of registry record |rgData|, or null when it has no bundle location, the base
+  // set-up rejects it (a missing identifier is logged), or diagnose finds it mis-configured
+  // (logged as "ignoring mis-configured plug-in at <path>: <error description>"). A nil UUID
+  // counts as missing and is replaced by a random one. "HubProtocolVersion" is taken when it
+  // is a number (or boolean) between 0 and 2^32 - 1; otherwise, as when it is absent, the
+  // version is 1 for a legacy manifest (Info.plist has "Annexa") and 2 for any other.
+  static std::shared_ptr<AXDPlugIn> initWithRGData(
+      std::shared_ptr<const registrum::PlugInRecord> rgData);
+
+  // The registry record this record was built from; never null for a record made by
+  // initWithRGData.
+  const std::shared_ptr<const registrum::PlugInRecord>& rgproxy() const { return rgproxy_; }
+
+  // ---- Lookups through the registry record -------------------------------------------------
+
+  // The registry record's value for |key| in the raw Info.plist, of any type, or absent.
+  std::optional<value::Value> infoKey(std::string_view key) const override;
+  // The registry record's value for |key| in the plug-in dictionary, or absent.
+  std::optional<value::Value> pluginKey(std::string_view key) const override;
+  // The registry record's value for |key| in the attributes, or absent.
+  std::optional<value::Value> attribute(std::string_view key) const override;
+  // The registry record's Info.plist.
+  std::optional<value::Dictionary> bundleInfoDictionary() const override;
+
+  // The cached display name; when the cache is empty, the registry's value (for the containing
+  // name, that of the containing application), stored in the cache and returned. Absent, and
+  // the cache left empty, when the registry has none. The base setters fill the caches.
+  std::optional<std::string> localizedName() const override;
+  std::optional<std::string> localizedShortName() const override;
+  std::optional<std::string> localizedContainingName() const override;
+
+  // ---- Checks and forms ----------------------------------------------------------------------
+
+  // The base checks, then "this plug-in has no sandbox data container" for a plug-in that is
+  // not a data plug-in and has no data container, then "plug-ins outside containing apps must
+  // be in /System" for a plug-in outside any application whose path does not begin with the
+  // system volume "<root>/System/". Errors are of domain "Annexa", code 12; absent when none
+  // fails.
+  std::optional<AXError> diagnose() const override;
+
+  // |form| with "extensions" set to issueResourceExtensions of the plug-in's "Shared" resources
+  // (of ["."], the whole bundle, for an app extension), even when that dictionary is empty.
+  // Unchanged when the plug-in is not an app extension and has no "Shared".
+  value::Dictionary augmentForm(const value::Dictionary& form) const;
+
+  // A read-extension token for each resource of |resources| (a string or an array of strings;
+  // other elements are skipped), by resource name: "." names the bundle, anything else a path
+  // inside it. A resource whose extension cannot be issued is left out and logged as "failed
+  // to make extension for <target> in plug-in at <path>: <strerror>". Empty for a value that is
+  // neither a string nor an array.
+  value::Dictionary issueResourceExtensions(const value::Value& resources) const;
+
+  // ---- Entitlements and annotations ----------------------------------------------------------
+
+  // The plug-in's entitlement |name|, or absent.
+  std::optional<value::Value> valueForEntitlement(std::string_view name) const;
+  // True when the entitlement is present and not false: a boolean is itself, a number is true
+  // unless 0, any other value is true.
+  bool hasEntitlement(std::string_view name) const;
+  // The key of the plug-in's annotations: the entitlement "<vendor prefix>.developer.replace-
+  // plugin" when it is a string, else the identifier (always present in a record made by
+  // initWithRGData).
+  std::string annotationKey() const;
+
+  // A new dictionary with the entries of |dictionary| whose keys do not begin with "DT".
+  static value::Dictionary prunedInfoDictionaryFor(const value::Dictionary& dictionary);
+
+ private:
+  AXDPlugIn() = default;
+
+  // Fills the base display-name field through |setter| with |fetched| when it holds a value.
+  // Filling a cache does not change what the record describes, so it is allowed on a const
+  // record (every record is created non-const by initWithRGData).
+  std::optional<std::string> fillCache(void (AXPlugInCore::*setter)(std::optional<std::string>),
+                                       std::optional<std::string> fetched) const;
+  std::optional<value::Value> lookup(std::string_view key,
+                                     registrum::PlugInRecord::Scope scope) const;
+
+  std::shared_ptr<const registrum::PlugInRecord> rgproxy_;
+};

@@ -1,0 +1,53 @@
+#pragma once
+
+#include <sqlite3.h>
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <string>
+
+#include "platform/os/Error.h"
+#include "platform/registrum/Statement.h"
+
+namespace registrum {
+
+// One SQLite connection in WAL mode with a busy timeout and a cache of prepared statements.
+// Not thread-safe: its owner serialises every use (the Store's mutex, or the notice thread that
+// owns the connection).
+class Database {
+ public:
+  // How long a statement waits for another connection's write lock before failing with EBUSY.
+  static constexpr int kBusyTimeoutMs = 10000;
+
+  // Opens (creating when missing) the database file at |path| and switches it to WAL mode.
+  // Fails with EIO and SQLite's message, or ENOENT/EACCES-like errors of the file.
+  static os::Result<std::unique_ptr<Database>> open(const std::string& path);
+
+  ~Database();
+  Database(const Database&) = delete;
+  Database& operator=(const Database&) = delete;
+
+  // The statement for |sql|, prepared once and then reused. Fails with EIO for bad SQL.
+  os::Result<Statement> prepare(const std::string& sql);
+
+  // Runs |sql| (several statements allowed) without results.
+  os::Status execute(const std::string& sql);
+
+  // Runs |body| inside BEGIN IMMEDIATE ... COMMIT; rolls back when |body| or the commit fails
+  // and returns that failure. Not re-entrant.
+  os::Status transaction(const std::function<os::Status()>& body);
+
+  // Finalises the cached statements and returns the connection's spare memory to the system.
+  void releaseMemory();
+
+ private:
+  explicit Database(sqlite3* db) : db_(db) {}
+
+  os::Error error(const std::string& what) const;
+
+  sqlite3* db_;
+  std::map<std::string, sqlite3_stmt*> statements_;
+};
+
+}  // namespace registrum

@@ -1,0 +1,107 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/registrum/ApplicationRecord.h"
+#include "platform/value/Value.h"
+
+namespace registrum {
+
+// The registry's record of one registered plug-in bundle, as it was when the record was read
+// (a notice's records included). Immutable; shared by std::shared_ptr<const PlugInRecord> and
+// safe to read from any thread. Two records describe the same plug-in when their UUIDs are
+// equal.
+class PlugInRecord {
+ public:
+  // Where valueForKey looks.
+  enum class Scope {
+    Attributes,        // the plug-in dictionary's "QSExtensionAttributes"
+    PlugInDictionary,  // the plug-in dictionary (resolved "QSExtension")
+    InfoDictionary,    // the raw Info.plist, as the bundle holds it
+  };
+
+  struct Fields {
+    value::Uuid uuid;
+    std::optional<std::string> bundlePath;
+    std::shared_ptr<const ApplicationRecord> containingApplication;
+    std::optional<std::string> plugInIdentifier;
+    std::optional<std::string> originalIdentifier;
+    std::optional<std::string> bundleIdentifier;
+    std::optional<std::string> bundleVersion;
+    std::optional<std::string> extensionPointIdentifier;
+    value::Dictionary entitlements;
+    double registrationDate = 0;
+    bool onSystemPartition = false;
+    std::optional<std::string> dataContainerPath;
+    value::Dictionary plugInDictionary;
+    value::Dictionary infoDictionary;
+    std::optional<std::string> localizedName;
+    std::optional<std::string> localizedShortName;
+  };
+
+  explicit PlugInRecord(Fields fields) : fields_(std::move(fields)) {}
+
+  // Assigned at the first registration of the bundle's path; kept while that path stays
+  // registered, re-registrations included.
+  const value::Uuid& uuid() const { return fields_.uuid; }
+  // The bundle location: canonical path of the bundle directory. Always present for records
+  // the registry makes; nothing only in records built by hand (tests, fakes).
+  const std::optional<std::string>& bundlePath() const { return fields_.bundlePath; }
+  // The nearest enclosing ".app" bundle's record; null for a plug-in outside any application.
+  const std::shared_ptr<const ApplicationRecord>& containingApplication() const {
+    return fields_.containingApplication;
+  }
+  // The plug-in dictionary's "QSExtensionIdentifier" when it is a string, else Info.plist's
+  // "QFBundleIdentifier" when it is a string; nothing when neither is.
+  const std::optional<std::string>& plugInIdentifier() const { return fields_.plugInIdentifier; }
+  // The identifier the bundle declared when registered. This registry never renames a
+  // plug-in, so it equals plugInIdentifier().
+  const std::optional<std::string>& originalIdentifier() const {
+    return fields_.originalIdentifier;
+  }
+  // Info.plist's "QFBundleIdentifier" when it is a string; nothing otherwise.
+  const std::optional<std::string>& bundleIdentifier() const { return fields_.bundleIdentifier; }
+  // Info.plist's "QFBundleShortVersionString" when it is a string; nothing otherwise.
+  const std::optional<std::string>& bundleVersion() const { return fields_.bundleVersion; }
+  // The plug-in dictionary's "QSExtensionPointIdentifier" when it is a string; nothing
+  // otherwise.
+  const std::optional<std::string>& extensionPointIdentifier() const {
+    return fields_.extensionPointIdentifier;
+  }
+  // The dictionary of the bundle's Entitlements.plist; empty when the bundle has none.
+  const value::Dictionary& entitlements() const { return fields_.entitlements; }
+  // When the bundle was last registered, in seconds since 1970-01-01 00:00 UTC.
+  double registrationDate() const { return fields_.registrationDate; }
+  // True when the bundle lies on the system volume, under "<root>/System/".
+  bool onSystemPartition() const { return fields_.onSystemPartition; }
+  // The plug-in's data container "<root>/var/containers/<UUID>"; nothing for a plug-in
+  // registered without one.
+  const std::optional<std::string>& dataContainerPath() const { return fields_.dataContainerPath; }
+  // Info.plist's "QSExtension" resolved against its extension point's SDK dictionary, with the
+  // attributes and version defaults filled (sdk::SdkRegistry::resolve).
+  const value::Dictionary& plugInDictionary() const { return fields_.plugInDictionary; }
+  // The bundle's Info.plist as read, before SDK resolution.
+  const value::Dictionary& infoDictionary() const { return fields_.infoDictionary; }
+  // Info.plist's "QFBundleDisplayName", else "QFBundleName" (strings only); nothing when
+  // neither is present.
+  const std::optional<std::string>& localizedName() const { return fields_.localizedName; }
+  // Info.plist's "QFBundleName", else "QFBundleDisplayName" (strings only); nothing when
+  // neither is present.
+  const std::optional<std::string>& localizedShortName() const {
+    return fields_.localizedShortName;
+  }
+
+  // The value under |key| in |scope|, of any type; nothing when the key is absent (or, for
+  // Attributes, when the plug-in dictionary has no attributes dictionary).
+  std::optional<value::Value> valueForKey(std::string_view key, Scope scope) const;
+
+  const Fields& fields() const { return fields_; }
+
+ private:
+  const Fields fields_;
+};
+
+}  // namespace registrum

@@ -1,0 +1,67 @@
+#include "platform/registrum/Schema.h"
+
+#include <cerrno>
+
+namespace registrum {
+
+namespace {
+
+constexpr const char* kTables = R"sql(
+CREATE TABLE IF NOT EXISTS schema_version (version INTEGER NOT NULL);
+CREATE TABLE IF NOT EXISTS applications (
+  path TEXT PRIMARY KEY,
+  bundle_identifier TEXT,
+  bundle_version TEXT,
+  localized_name TEXT,
+  placeholder INTEGER NOT NULL
+);
+CREATE TABLE IF NOT EXISTS plugins (
+  uuid TEXT PRIMARY KEY,
+  path TEXT NOT NULL UNIQUE,
+  application_path TEXT REFERENCES applications(path),
+  plugin_identifier TEXT,
+  rule_point TEXT,
+  registration_date REAL NOT NULL,
+  on_system_partition INTEGER NOT NULL,
+  data_container TEXT,
+  entitlements BLOB NOT NULL,
+  info BLOB NOT NULL,
+  plugin_dictionary BLOB NOT NULL
+);
+CREATE INDEX IF NOT EXISTS plugins_by_identifier ON plugins(plugin_identifier);
+CREATE INDEX IF NOT EXISTS plugins_by_rule_point ON plugins(rule_point);
+CREATE INDEX IF NOT EXISTS plugins_by_application ON plugins(application_path);
+CREATE TABLE IF NOT EXISTS changes (
+  sequence INTEGER PRIMARY KEY AUTOINCREMENT,
+  kind INTEGER NOT NULL,
+  records BLOB NOT NULL
+);
+)sql";
+
+os::Status checkVersion(Database& db) {
+  os::Result<Statement> select = db.prepare("SELECT version FROM schema_version");
+  if (!select.ok()) return select.error();
+  os::Result<bool> row = select.value().step();
+  if (!row.ok()) return row.error();
+  if (!row.value()) {
+    os::Result<Statement> insert = db.prepare("INSERT INTO schema_version (version) VALUES (?)");
+    if (!insert.ok()) return insert.error();
+    return insert.value().bind(1, std::int64_t{Schema::kVersion}).run();
+  }
+  std::int64_t version = select.value().integer(0);
+  if (version == Schema::kVersion) return os::success();
+  return os::Error{EIO, "registry database has schema version " + std::to_string(version) +
+                            ", this program reads version " + std::to_string(Schema::kVersion)};
+}
+
+}  // namespace
+
+os::Status Schema::ensure(Database& db) {
+  return db.transaction([&]() -> os::Status {
+    os::Status created = db.execute(kTables);
+    if (!created.ok()) return created;
+    return checkVersion(db);
+  });
+}
+
+}  // namespace registrum

@@ -1,0 +1,243 @@
+#include "platform/registrum/Store.h"
+
+#include <cerrno>
+
+#include "platform/registrum/RecordCodec.h"
+#include "platform/registrum/RecordFields.h"
+#include "platform/registrum/Schema.h"
+
+namespace registrum {
+
+namespace {
+
+// Plug-in columns 0-7, then the application's columns 8-12 (all NULL without one).
+constexpr const char* kPlugInSelect =
+    "SELECT p.uuid, p.path, p.registration_date, p.on_system_partition, p.data_container, "
+    "p.entitlements, p.info, p.plugin_dictionary, "
+    "a.path, a.bundle_identifier, a.bundle_version, a.localized_name, a.placeholder "
+    "FROM plugins p LEFT JOIN applications a ON a.path = p.application_path ";
+constexpr int kApplicationColumn = 8;
+
+constexpr const char* kApplicationSelect =
+    "SELECT path, bundle_identifier, bundle_version, localized_name, placeholder "
+    "FROM applications ";
+
+os::Error corrupt(const std::string& what, const os::Error& cause) {
+  return os::Error{EIO, "registry database: " + what + ": " + cause.message};
+}
+
+}  // namespace
+
+os::Result<std::unique_ptr<Store>> Store::open(const std::string& path) {
+  os::Result<std::unique_ptr<Database>> db = Database::open(path);
+  if (!db.ok()) return db.error();
+  os::Status schema = Schema::ensure(*db.value());
+  if (!schema.ok()) return schema.error();
+  return std::unique_ptr<Store>(new Store(std::move(db.value())));
+}
+
+os::Result<std::shared_ptr<const ApplicationRecord>> Store::application(const std::string& path) {
+  os::Result<Statement> select = db_->prepare(std::string(kApplicationSelect) + "WHERE path = ?");
+  if (!select.ok()) return select.error();
+  select.value().bind(1, path);
+  os::Result<bool> row = select.value().step();
+  if (!row.ok()) return row.error();
+  if (!row.value()) return std::shared_ptr<const ApplicationRecord>();
+  return applicationRow(select.value(), 0);
+}
+
+os::Result<std::shared_ptr<const PlugInRecord>> Store::plugInByUuid(const value::Uuid& uuid) {
+  return onePlugIn("p.uuid", uuid.string());
+}
+
+os::Result<std::shared_ptr<const PlugInRecord>> Store::plugInByPath(const std::string& path) {
+  return onePlugIn("p.path", path);
+}
+
+os::Result<PlugInList> Store::plugInsOfApplication(const std::string& path) {
+  os::Result<Statement> select =
+      db_->prepare(std::string(kPlugInSelect) + "WHERE p.application_path = ? ORDER BY p.path");
+  if (!select.ok()) return select.error();
+  select.value().bind(1, path);
+  return plugInRows(select.value());
+}
+
+os::Result<std::vector<std::shared_ptr<const ApplicationRecord>>> Store::applications() {
+  os::Result<Statement> select = db_->prepare(std::string(kApplicationSelect) + "ORDER BY path");
+  if (!select.ok()) return select.error();
+  std::vector<std::shared_ptr<const ApplicationRecord>> applications;
+  for (;;) {
+    os::Result<bool> row = select.value().step();
+    if (!row.ok()) return row.error();
+    if (!row.value()) return applications;
+    applications.push_back(applicationRow(select.value(), 0));
+  }
+}
+
+os::Result<PlugInList> Store::plugIns(const Selection& selection) {
+  // Unset parameters are NULL and admit every row.
+  os::Result<Statement> select =
+      db_->prepare(std::string(kPlugInSelect) +
+                   "WHERE (?1 IS NULL OR p.plugin_identifier = ?1) "
+                   "AND (?2 IS NULL OR p.rule_point = ?2 OR p.rule_point IS NULL) "
+                   "AND (?3 = 0 OR a.placeholder IS NULL OR a.placeholder = 0) ORDER BY p.path");
+  if (!select.ok()) return select.error();
+  select.value()
+      .bind(1, selection.plugInIdentifier)
+      .bind(2, selection.rulePoint)
+      .bind(3, std::int64_t{selection.excludePlaceholders});
+  return plugInRows(select.value());
+}
+
+os::Status Store::putApplication(const ApplicationRecord::Fields& fields) {
+  os::Result<Statement> upsert = db_->prepare(
+      "INSERT INTO applications (path, bundle_identifier, bundle_version, localized_name, "
+      "placeholder) VALUES (?1, ?2, ?3, ?4, ?5) ON CONFLICT (path) DO UPDATE SET "
+      "bundle_identifier = ?2, bundle_version = ?3, localized_name = ?4, placeholder = ?5");
+  if (!upsert.ok()) return upsert.error();
+  return upsert.value()
+      .bind(1, fields.path)
+      .bind(2, fields.bundleIdentifier)
+      .bind(3, fields.bundleVersion)
+      .bind(4, fields.localizedName)
+      .bind(5, std::int64_t{fields.placeholder})
+      .run();
+}
+
+os::Status Store::putPlugIn(const PlugInRecord::Fields& fields) {
+  os::Result<Statement> upsert = db_->prepare(
+      "INSERT OR REPLACE INTO plugins (uuid, path, application_path, plugin_identifier, "
+      "rule_point, registration_date, on_system_partition, data_container, entitlements, info, "
+      "plugin_dictionary) VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?)");
+  if (!upsert.ok()) return upsert.error();
+  std::optional<std::string> application;
+  if (fields.containingApplication) application = fields.containingApplication->path();
+  return upsert.value()
+      .bind(1, fields.uuid.string())
+      .bind(2, fields.bundlePath)
+      .bind(3, application)
+      .bind(4, fields.plugInIdentifier)
+      .bind(5, RecordFields::rulePoint(fields))
+      .bind(6, fields.registrationDate)
+      .bind(7, std::int64_t{fields.onSystemPartition})
+      .bind(8, fields.dataContainerPath)
+      .bind(9, RecordCodec::encodeDictionary(fields.entitlements))
+      .bind(10, RecordCodec::encodeDictionary(fields.infoDictionary))
+      .bind(11, RecordCodec::encodeDictionary(fields.plugInDictionary))
+      .run();
+}
+
+os::Status Store::deletePlugIn(const value::Uuid& uuid) {
+  os::Result<Statement> remove = db_->prepare("DELETE FROM plugins WHERE uuid = ?");
+  if (!remove.ok()) return remove.error();
+  return remove.value().bind(1, uuid.string()).run();
+}
+
+os::Status Store::deleteApplication(const std::string& path) {
+  os::Result<Statement> plugIns = db_->prepare("DELETE FROM plugins WHERE application_path = ?");
+  if (!plugIns.ok()) return plugIns.error();
+  os::Status removed = plugIns.value().bind(1, path).run();
+  if (!removed.ok()) return removed;
+  os::Result<Statement> application = db_->prepare("DELETE FROM applications WHERE path = ?");
+  if (!application.ok()) return application.error();
+  return application.value().bind(1, path).run();
+}
+
+os::Status Store::appendChange(ChangeKind kind, const PlugInList& records) {
+  os::Result<Statement> insert = db_->prepare("INSERT INTO changes (kind, records) VALUES (?, ?)");
+  if (!insert.ok()) return insert.error();
+  os::Status inserted = insert.value()
+                            .bind(1, static_cast<std::int64_t>(kind))
+                            .bind(2, RecordCodec::encodeList(records))
+                            .run();
+  if (!inserted.ok()) return inserted;
+  os::Result<Statement> trim =
+      db_->prepare("DELETE FROM changes WHERE sequence <= (SELECT MAX(sequence) FROM changes) - ?");
+  if (!trim.ok()) return trim.error();
+  return trim.value().bind(1, std::int64_t{Schema::kChangesKept}).run();
+}
+
+os::Result<std::int64_t> Store::lastSequence() {
+  os::Result<Statement> select = db_->prepare("SELECT IFNULL(MAX(sequence), 0) FROM changes");
+  if (!select.ok()) return select.error();
+  os::Result<bool> row = select.value().step();
+  if (!row.ok()) return row.error();
+  return select.value().integer(0);
+}
+
+os::Result<std::vector<Store::Change>> Store::changesAfter(std::int64_t sequence, int limit) {
+  os::Result<Statement> select = db_->prepare(
+      "SELECT sequence, kind, records FROM changes WHERE sequence > ? ORDER BY sequence LIMIT ?");
+  if (!select.ok()) return select.error();
+  select.value().bind(1, sequence).bind(2, std::int64_t{limit});
+  std::vector<Change> changes;
+  for (;;) {
+    os::Result<bool> row = select.value().step();
+    if (!row.ok()) return row.error();
+    if (!row.value()) return changes;
+    std::span<const std::uint8_t> records = select.value().blob(2);
+    changes.push_back(Change{select.value().integer(0),
+                             static_cast<ChangeKind>(select.value().integer(1)),
+                             {records.begin(), records.end()}});
+  }
+}
+
+os::Result<std::shared_ptr<const PlugInRecord>> Store::onePlugIn(const std::string& where,
+                                                                 const std::string& key) {
+  os::Result<Statement> select =
+      db_->prepare(std::string(kPlugInSelect) + "WHERE " + where + " = ?");
+  if (!select.ok()) return select.error();
+  select.value().bind(1, key);
+  os::Result<bool> row = select.value().step();
+  if (!row.ok()) return row.error();
+  if (!row.value()) return std::shared_ptr<const PlugInRecord>();
+  return plugInRow(select.value());
+}
+
+os::Result<PlugInList> Store::plugInRows(Statement& statement) {
+  PlugInList plugIns;
+  for (;;) {
+    os::Result<bool> row = statement.step();
+    if (!row.ok()) return row.error();
+    if (!row.value()) return plugIns;
+    os::Result<std::shared_ptr<const PlugInRecord>> record = plugInRow(statement);
+    if (!record.ok()) return record.error();
+    plugIns.push_back(std::move(record.value()));
+  }
+}
+
+os::Result<std::shared_ptr<const PlugInRecord>> Store::plugInRow(const Statement& row) {
+  PlugInRecord::Fields fields;
+  std::string uuid = row.text(0);
+  std::optional<value::Uuid> parsed = value::Uuid::parse(uuid);
+  if (!parsed) return os::Error{EIO, "registry database: malformed plug-in UUID " + uuid};
+  fields.uuid = *parsed;
+  fields.bundlePath = row.text(1);
+  fields.registrationDate = row.real(2);
+  fields.onSystemPartition = row.integer(3) != 0;
+  fields.dataContainerPath = row.optionalText(4);
+  value::Dictionary* blobs[] = {&fields.entitlements, &fields.infoDictionary,
+                                &fields.plugInDictionary};
+  for (int i = 0; i < 3; ++i) {
+    os::Result<value::Dictionary> decoded = RecordCodec::decodeDictionary(row.blob(5 + i));
+    if (!decoded.ok()) return corrupt("plug-in " + uuid, decoded.error());
+    *blobs[i] = decoded.value();
+  }
+  if (!row.isNull(kApplicationColumn)) {
+    fields.containingApplication = applicationRow(row, kApplicationColumn);
+  }
+  RecordFields::derive(fields);
+  return std::make_shared<const PlugInRecord>(std::move(fields));
+}
+
+std::shared_ptr<const ApplicationRecord> Store::applicationRow(const Statement& row, int first) {
+  return std::make_shared<const ApplicationRecord>(ApplicationRecord::Fields{
+      .path = row.text(first),
+      .bundleIdentifier = row.optionalText(first + 1),
+      .bundleVersion = row.optionalText(first + 2),
+      .localizedName = row.optionalText(first + 3),
+      .placeholder = row.integer(first + 4) != 0,
+  });
+}
+
+}  // namespace registrum

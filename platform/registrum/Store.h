@@ -1,0 +1,76 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/os/Error.h"
+#include "platform/registrum/Database.h"
+#include "platform/registrum/Observer.h"
+
+namespace registrum {
+
+// The registry's rows over one database connection: reads and writes of applications, plug-ins
+// and the change log. Not thread-safe: its owner serialises every call (Workspace's mutex, or
+// the notice thread that owns its own Store). Writes that belong together run inside
+// database().transaction().
+class Store {
+ public:
+  enum class ChangeKind : std::int64_t { Install = 1, Uninstall = 2 };
+
+  struct Change {
+    std::int64_t sequence = 0;
+    ChangeKind kind = ChangeKind::Install;
+    std::vector<std::uint8_t> records;  // RecordCodec::encodeList
+  };
+
+  // Which plug-ins plugIns() returns; every unset criterion admits all.
+  struct Selection {
+    std::optional<std::string> plugInIdentifier;
+    // Also admits plug-ins without a pre-selection extension point.
+    std::optional<std::string> rulePoint;
+    bool excludePlaceholders = true;
+  };
+
+  // Opens the database file at |path| and makes sure its schema is in place.
+  static os::Result<std::unique_ptr<Store>> open(const std::string& path);
+
+  Database& database() { return *db_; }
+
+  // Lookups: a null pointer when there is no such row.
+  os::Result<std::shared_ptr<const ApplicationRecord>> application(const std::string& path);
+  os::Result<std::shared_ptr<const PlugInRecord>> plugInByUuid(const value::Uuid& uuid);
+  os::Result<std::shared_ptr<const PlugInRecord>> plugInByPath(const std::string& path);
+  os::Result<PlugInList> plugInsOfApplication(const std::string& path);
+  os::Result<std::vector<std::shared_ptr<const ApplicationRecord>>> applications();
+  os::Result<PlugInList> plugIns(const Selection& selection);
+
+  // Inserts or updates the row of |fields|.path (applications) or |fields|.uuid (plug-ins).
+  os::Status putApplication(const ApplicationRecord::Fields& fields);
+  os::Status putPlugIn(const PlugInRecord::Fields& fields);
+  os::Status deletePlugIn(const value::Uuid& uuid);
+  // Deletes the application at |path| and every plug-in row that names it.
+  os::Status deleteApplication(const std::string& path);
+
+  // Appends a change-log entry and trims the log to Schema::kChangesKept entries.
+  os::Status appendChange(ChangeKind kind, const PlugInList& records);
+  // The newest change's sequence number; 0 for an empty log.
+  os::Result<std::int64_t> lastSequence();
+  // Up to |limit| changes after |sequence|, oldest first.
+  os::Result<std::vector<Change>> changesAfter(std::int64_t sequence, int limit);
+
+ private:
+  explicit Store(std::unique_ptr<Database> db) : db_(std::move(db)) {}
+
+  os::Result<std::shared_ptr<const PlugInRecord>> onePlugIn(const std::string& where,
+                                                            const std::string& key);
+  os::Result<PlugInList> plugInRows(Statement& statement);
+  static os::Result<std::shared_ptr<const PlugInRecord>> plugInRow(const Statement& row);
+  static std::shared_ptr<const ApplicationRecord> applicationRow(const Statement& row, int first);
+
+  std::unique_ptr<Database> db_;
+};
+
+}  // namespace registrum

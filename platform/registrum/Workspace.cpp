@@ -1,0 +1,358 @@
+#include "platform/registrum/Workspace.h"
+
+#include <cerrno>
+#include <chrono>
+#include <filesystem>
+#include <map>
+
+#include "platform/os/Log.h"
+#include "platform/os/Paths.h"
+#include "platform/registrum/BundleReader.h"
+#include "platform/registrum/ChangeWatcher.h"
+#include "platform/registrum/RecordFields.h"
+#include "platform/registrum/Store.h"
+#include "platform/sdk/SdkRegistry.h"
+
+namespace registrum {
+
+struct Workspace::PendingFiles {
+  std::vector<std::string> created;  // removed when the change fails
+  std::vector<std::string> retired;  // removed when the change commits
+};
+
+namespace {
+
+constexpr int kLogWarning = 4;
+
+double now() {
+  return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
+}
+
+void removeAll(const std::vector<std::string>& paths) {
+  for (const std::string& path : paths) {
+    std::error_code error;
+    std::filesystem::remove_all(path, error);
+    if (error) {
+      os::Log::write(kLogWarning, "registry: cannot remove " + path + ": " + error.message());
+    }
+  }
+}
+
+// A rule entry's value when it is a plain string: equality with the text, never an operator.
+std::optional<std::string> plainString(const value::Dictionary& rule, std::string_view key) {
+  std::optional<std::string> text = RecordFields::string(rule, key);
+  if (!text || text->empty()) return text;
+  char first = text->front();
+  if (first == '?' || first == '<' || first == '>') return std::nullopt;
+  if (first == '=') return text->substr(1);
+  return text;
+}
+
+bool endsWith(std::string_view text, std::string_view suffix) {
+  return text.size() > suffix.size() && text.substr(text.size() - suffix.size()) == suffix;
+}
+
+}  // namespace
+
+os::Result<std::shared_ptr<Workspace>> Workspace::defaultWorkspace() {
+  static std::mutex mutex;
+  static std::map<std::string, std::weak_ptr<Workspace>> workspaces;
+  std::string root = os::Paths::root();
+  std::lock_guard lock(mutex);
+  if (std::shared_ptr<Workspace> existing = workspaces[root].lock()) return existing;
+  os::Result<std::shared_ptr<Workspace>> opened = open(root);
+  if (opened.ok()) workspaces[root] = opened.value();
+  return opened;
+}
+
+os::Result<std::shared_ptr<Workspace>> Workspace::open(const std::string& root) {
+  std::string databaseDirectory = root + "/var/db";
+  os::Status directory = os::Paths::ensureDirectory(databaseDirectory, 0755);
+  if (!directory.ok()) return directory.error();
+  os::Result<std::string> canonicalRoot = os::Paths::canonical(root);
+  if (!canonicalRoot.ok()) return canonicalRoot.error();
+  std::string rootPath = canonicalRoot.value() == "/" ? "" : canonicalRoot.value();
+  os::Result<std::unique_ptr<Store>> store = Store::open(rootPath + "/var/db/registrum.sqlite");
+  if (!store.ok()) return store.error();
+  return std::shared_ptr<Workspace>(new Workspace(rootPath, std::move(store.value())));
+}
+
+Workspace::Workspace(std::string root, std::unique_ptr<Store> store)
+    : root_(std::move(root)), store_(std::move(store)) {}
+
+Workspace::~Workspace() = default;
+
+os::Status Workspace::addObserver(const std::shared_ptr<Observer>& observer) {
+  std::lock_guard lock(watcherMutex_);
+  if (!watcher_) {
+    os::Result<std::unique_ptr<ChangeWatcher>> started =
+        ChangeWatcher::start(databasePath(), notifyFile());
+    if (!started.ok()) return started.error();
+    watcher_ = std::move(started.value());
+  }
+  os::Result<std::int64_t> sequence = [&] {
+    std::lock_guard storeLock(storeMutex_);
+    return store_->lastSequence();
+  }();
+  if (!sequence.ok()) return sequence.error();
+  watcher_->add(observer, sequence.value());
+  return os::success();
+}
+
+void Workspace::removeObserver(const Observer* observer) {
+  std::lock_guard lock(watcherMutex_);
+  if (watcher_) watcher_->remove(observer);
+}
+
+os::Result<std::shared_ptr<const PlugInRecord>> Workspace::plugInForUuid(
+    const value::Uuid& uuid) const {
+  std::lock_guard lock(storeMutex_);
+  return store_->plugInByUuid(uuid);
+}
+
+os::Result<std::shared_ptr<const PlugInRecord>> Workspace::plugInAtPath(
+    const std::string& path) const {
+  std::string key = lookupKey(path);
+  std::lock_guard lock(storeMutex_);
+  return store_->plugInByPath(key);
+}
+
+os::Result<std::shared_ptr<const ApplicationRecord>> Workspace::applicationAtPath(
+    const std::string& path) const {
+  std::string key = lookupKey(path);
+  std::lock_guard lock(storeMutex_);
+  return store_->application(key);
+}
+
+os::Result<PlugInList> Workspace::plugInsWithinApplication(const std::string& path) const {
+  std::string key = lookupKey(path);
+  std::lock_guard lock(storeMutex_);
+  return store_->plugInsOfApplication(key);
+}
+
+os::Result<std::vector<std::shared_ptr<const ApplicationRecord>>> Workspace::listApplications()
+    const {
+  std::lock_guard lock(storeMutex_);
+  return store_->applications();
+}
+
+os::Result<PlugInList> Workspace::listPlugIns() const {
+  std::lock_guard lock(storeMutex_);
+  return store_->plugIns(Store::Selection{});
+}
+
+os::Result<PlugInList> Workspace::query(const value::Dictionary& rule, const Filter& filter) const {
+  Store::Selection selection{plainString(rule, "QSExtensionIdentifier"),
+                             plainString(rule, "QSExtensionPointIdentifier"), true};
+  os::Result<PlugInList> candidates = [&] {
+    std::lock_guard lock(storeMutex_);
+    return store_->plugIns(selection);
+  }();
+  if (!candidates.ok() || !filter) return candidates;
+  PlugInList kept;
+  for (const auto& record : candidates.value()) {
+    if (filter(record->plugInIdentifier().value_or(""), record->entitlements())) {
+      kept.push_back(record);
+    }
+  }
+  return kept;
+}
+
+os::Result<std::shared_ptr<const PlugInRecord>> Workspace::registerPlugIn(const std::string& path,
+                                                                          RegisterOptions options) {
+  os::Result<PlugInBundle> bundle = BundleReader::readPlugIn(path);
+  if (!bundle.ok()) return bundle.error();
+  std::shared_ptr<const PlugInRecord> registered;
+  os::Status status = change([&](PendingFiles& files) -> os::Status {
+    os::Result<std::shared_ptr<const ApplicationRecord>> application =
+        containingApplication(bundle.value());
+    if (!application.ok()) return application.error();
+    os::Result<std::shared_ptr<const PlugInRecord>> stored =
+        storePlugIn(bundle.value(), application.value(), options.dataContainer, files);
+    if (!stored.ok()) return stored.error();
+    registered = stored.value();
+    return store_->appendChange(Store::ChangeKind::Install, {registered});
+  });
+  if (!status.ok()) return status.error();
+  return registered;
+}
+
+os::Status Workspace::unregisterPlugIn(const std::string& path) {
+  std::string key = lookupKey(path);
+  return change([&](PendingFiles& files) -> os::Status {
+    os::Result<std::shared_ptr<const PlugInRecord>> record = store_->plugInByPath(key);
+    if (!record.ok()) return record.error();
+    if (!record.value()) return os::Error{ENOENT, "no plug-in is registered at " + key};
+    os::Status removed = store_->deletePlugIn(record.value()->uuid());
+    if (!removed.ok()) return removed;
+    if (auto container = record.value()->dataContainerPath()) files.retired.push_back(*container);
+    return store_->appendChange(Store::ChangeKind::Uninstall, {record.value()});
+  });
+}
+
+os::Result<std::shared_ptr<const ApplicationRecord>> Workspace::installApplication(
+    const std::string& path, InstallOptions options) {
+  os::Result<std::string> directory = BundleReader::bundleDirectory(path);
+  if (!directory.ok()) return directory.error();
+  if (!endsWith(directory.value(), ".app")) {
+    return os::Error{EINVAL,
+                     "not an application bundle (its name must end in .app): " + directory.value()};
+  }
+  os::Result<value::Dictionary> info = BundleReader::readInfo(directory.value());
+  if (!info.ok()) return info.error();
+  os::Result<std::vector<PlugInBundle>> bundles = BundleReader::readPlugInsOf(directory.value());
+  if (!bundles.ok()) return bundles.error();
+  auto application = std::make_shared<const ApplicationRecord>(
+      RecordFields::application(directory.value(), info.value(), options.placeholder));
+  os::Status status = change([&](PendingFiles& files) -> os::Status {
+    os::Result<std::shared_ptr<const ApplicationRecord>> existing =
+        store_->application(application->path());
+    if (!existing.ok()) return existing.error();
+    if (existing.value()) {
+      return os::Error{EEXIST, "an application is already installed at " + application->path()};
+    }
+    os::Status put = store_->putApplication(application->fields());
+    if (!put.ok()) return put;
+    PlugInList installed;
+    for (const PlugInBundle& bundle : bundles.value()) {
+      os::Result<std::shared_ptr<const PlugInRecord>> stored =
+          storePlugIn(bundle, application, options.dataContainer, files);
+      if (!stored.ok()) return stored.error();
+      installed.push_back(stored.value());
+    }
+    if (installed.empty()) return os::success();
+    return store_->appendChange(Store::ChangeKind::Install, installed);
+  });
+  if (!status.ok()) return status.error();
+  return application;
+}
+
+os::Status Workspace::finishInstallation(const std::string& path) {
+  std::string key = lookupKey(path);
+  return change([&](PendingFiles&) -> os::Status {
+    os::Result<std::shared_ptr<const ApplicationRecord>> application = store_->application(key);
+    if (!application.ok()) return application.error();
+    if (!application.value()) return os::Error{ENOENT, "no application is installed at " + key};
+    if (!application.value()->isPlaceholder()) {
+      return os::Error{EINVAL, "the application at " + key + " is not a placeholder"};
+    }
+    ApplicationRecord::Fields fields = application.value()->fields();
+    fields.placeholder = false;
+    os::Status put = store_->putApplication(fields);
+    if (!put.ok()) return put;
+    os::Result<PlugInList> plugIns = store_->plugInsOfApplication(key);
+    if (!plugIns.ok()) return plugIns.error();
+    if (plugIns.value().empty()) return os::success();
+    return store_->appendChange(Store::ChangeKind::Install, plugIns.value());
+  });
+}
+
+os::Status Workspace::uninstallApplication(const std::string& path) {
+  std::string key = lookupKey(path);
+  return change([&](PendingFiles& files) -> os::Status {
+    os::Result<std::shared_ptr<const ApplicationRecord>> application = store_->application(key);
+    if (!application.ok()) return application.error();
+    if (!application.value()) return os::Error{ENOENT, "no application is installed at " + key};
+    os::Result<PlugInList> plugIns = store_->plugInsOfApplication(key);
+    if (!plugIns.ok()) return plugIns.error();
+    os::Status removed = store_->deleteApplication(key);
+    if (!removed.ok()) return removed;
+    for (const auto& record : plugIns.value()) {
+      if (auto container = record->dataContainerPath()) files.retired.push_back(*container);
+    }
+    if (plugIns.value().empty()) return os::success();
+    return store_->appendChange(Store::ChangeKind::Uninstall, plugIns.value());
+  });
+}
+
+void Workspace::clearCaches() {
+  std::lock_guard lock(storeMutex_);
+  store_->database().releaseMemory();
+}
+
+std::string Workspace::databasePath() const {
+  return root_ + "/var/db/registrum.sqlite";
+}
+
+std::string Workspace::notifyFile() const {
+  return root_ + "/var/db/registrum.changed";
+}
+
+std::string Workspace::containerPath(const value::Uuid& uuid) const {
+  return root_ + "/var/containers/" + uuid.string();
+}
+
+std::string Workspace::lookupKey(const std::string& path) {
+  std::error_code error;
+  std::filesystem::path resolved = std::filesystem::weakly_canonical(path, error);
+  if (error) resolved = std::filesystem::absolute(path, error).lexically_normal();
+  std::string key = resolved.string();
+  while (key.size() > 1 && key.back() == '/') key.pop_back();
+  return key;
+}
+
+os::Status Workspace::change(const std::function<os::Status(PendingFiles&)>& body) {
+  PendingFiles files;
+  os::Status status = [&] {
+    std::lock_guard lock(storeMutex_);
+    return store_->database().transaction([&] { return body(files); });
+  }();
+  if (!status.ok()) {
+    removeAll(files.created);
+    return status;
+  }
+  removeAll(files.retired);
+  ChangeWatcher::announce(notifyFile());
+  std::lock_guard lock(watcherMutex_);
+  if (watcher_) watcher_->wake();
+  return status;
+}
+
+os::Result<std::shared_ptr<const ApplicationRecord>> Workspace::containingApplication(
+    const PlugInBundle& bundle) {
+  if (!bundle.applicationPath) return std::shared_ptr<const ApplicationRecord>();
+  const std::string& path = *bundle.applicationPath;
+  os::Result<std::shared_ptr<const ApplicationRecord>> existing = store_->application(path);
+  if (!existing.ok() || existing.value()) return existing;
+  // An application registered through one of its plug-ins may lack an Info.plist; a broken
+  // one is refused.
+  os::Result<value::Dictionary> info = BundleReader::readInfo(path);
+  if (!info.ok() && info.error().errnum != ENOENT) return info.error();
+  ApplicationRecord::Fields fields =
+      RecordFields::application(path, info.ok() ? info.value() : value::Dictionary(), false);
+  os::Status put = store_->putApplication(fields);
+  if (!put.ok()) return put.error();
+  return std::make_shared<const ApplicationRecord>(std::move(fields));
+}
+
+os::Result<std::shared_ptr<const PlugInRecord>> Workspace::storePlugIn(
+    const PlugInBundle& bundle, std::shared_ptr<const ApplicationRecord> application,
+    bool dataContainer, PendingFiles& files) {
+  os::Result<std::shared_ptr<const PlugInRecord>> earlier = store_->plugInByPath(bundle.path);
+  if (!earlier.ok()) return earlier.error();
+  PlugInRecord::Fields fields;
+  fields.uuid = earlier.value() ? earlier.value()->uuid() : value::Uuid::random();
+  fields.bundlePath = bundle.path;
+  fields.containingApplication = std::move(application);
+  fields.entitlements = bundle.entitlements;
+  fields.registrationDate = now();
+  fields.onSystemPartition = bundle.path.starts_with(root_ + "/System/");
+  fields.infoDictionary = bundle.info;
+  value::Dictionary resolved = sdk::SdkRegistry(root_.empty() ? "/" : root_).resolve(bundle.info);
+  fields.plugInDictionary = *resolved.find("QSExtension")->asDictionary();
+  std::string container = containerPath(fields.uuid);
+  if (dataContainer) {
+    if (!std::filesystem::exists(container)) files.created.push_back(container);
+    os::Status made = os::Paths::ensureDirectory(container, 0700);
+    if (!made.ok()) return made.error();
+    fields.dataContainerPath = container;
+  } else if (earlier.value() && earlier.value()->dataContainerPath()) {
+    files.retired.push_back(*earlier.value()->dataContainerPath());
+  }
+  RecordFields::derive(fields);
+  os::Status put = store_->putPlugIn(fields);
+  if (!put.ok()) return put.error();
+  return std::make_shared<const PlugInRecord>(std::move(fields));
+}
+
+}  // namespace registrum

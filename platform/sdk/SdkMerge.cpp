@@ -1,0 +1,79 @@
+#include "platform/sdk/SdkMerge.h"
+
+#include <algorithm>
+#include <map>
+
+namespace sdk {
+
+namespace {
+
+using value::Value;
+
+value::Array asList(const Value& resources) {
+  if (const value::Array* array = resources.asArray()) return *array;
+  if (resources.asString()) return {resources};
+  return {};
+}
+
+Value mergeValue(std::string_view key, const Value& sdkValue, const Value& manifestValue) {
+  if (sdkOverridesKey(key)) return sdkValue;
+  if (key == "Shared") return mergeSharedResources(sdkValue, manifestValue);
+  const value::Dictionary* sdkDictionary = sdkValue.asDictionary();
+  const value::Dictionary* manifestDictionary = manifestValue.asDictionary();
+  if (sdkDictionary && manifestDictionary) {
+    return Value::dictionary(mergeDictionary(*sdkDictionary, *manifestDictionary));
+  }
+  return manifestValue;
+}
+
+}  // namespace
+
+value::Dictionary mergeDictionary(const value::Dictionary& sdkSide,
+                                  const value::Dictionary& manifestSide) {
+  std::map<std::string, Value> merged = manifestSide.toMap();
+  for (const auto& [key, sdkValue] : sdkSide) {
+    auto found = merged.find(key);
+    if (found == merged.end()) {
+      merged.emplace(key, sdkValue);
+    } else {
+      found->second = mergeValue(key, sdkValue, found->second);
+    }
+  }
+  return value::Dictionary(std::move(merged));
+}
+
+bool sdkOverridesKey(std::string_view key) {
+  return key == "CleanTimeout";
+}
+
+Value mergeSharedResources(const Value& sdkSide, const Value& manifestSide) {
+  value::Array merged;
+  for (const value::Array& list : {asList(sdkSide), asList(manifestSide)}) {
+    for (const Value& element : list) {
+      if (std::find(merged.begin(), merged.end(), element) == merged.end()) {
+        merged.push_back(element);
+      }
+    }
+  }
+  return Value::array(std::move(merged));
+}
+
+value::Dictionary canonicalize(const value::Dictionary& info) {
+  const Value* plugIn = info.find("QSExtension");
+  const value::Dictionary* plugInDictionary = plugIn ? plugIn->asDictionary() : nullptr;
+  if (!plugInDictionary) return info;
+  const Value* attributesValue = plugInDictionary->find("QSExtensionAttributes");
+  const value::Dictionary* existing = attributesValue ? attributesValue->asDictionary() : nullptr;
+  value::Dictionary attributes = existing ? *existing : value::Dictionary();
+  if (!attributes.find("QSExtensionVersion")) {
+    const Value* bundleVersion = info.find("QFBundleShortVersionString");
+    bool usable = bundleVersion && bundleVersion->asString();
+    attributes =
+        attributes.with("QSExtensionVersion", usable ? *bundleVersion : Value::string("1"));
+  }
+  value::Dictionary completed =
+      plugInDictionary->with("QSExtensionAttributes", Value::dictionary(attributes));
+  return info.with("QSExtension", Value::dictionary(completed));
+}
+
+}  // namespace sdk

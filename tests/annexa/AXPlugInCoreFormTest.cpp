@@ -1,0 +1,195 @@
+#include <gtest/gtest.h>
+
+#include <set>
+
+#include "Annexa/AXPlugInCore.h"
+#include "LogCapture.h"
+#include "PlugInFixtures.h"
+#include "platform/value/PlistBridge.h"
+
+namespace {
+
+using namespace fixtures;
+using value::Value;
+
+std::set<std::string> keysOf(const value::Dictionary& form) {
+  std::set<std::string> keys;
+  for (const auto& [key, ignored] : form) keys.insert(key);
+  return keys;
+}
+
+const std::set<std::string> kAlwaysWritten = {"hubProtocolVersion",
+                                              "path",
+                                              "systemResident",
+                                              "identifier",
+                                              "original-identifier",
+                                              "version",
+                                              "bundleInfo",
+                                              "info",
+                                              "uuid",
+                                              "lastmodified",
+                                              "annotations"};
+
+// A canonicalised record with every field that export always writes.
+std::shared_ptr<AXPlugInCore> plainRecord() {
+  value::Value info = D({{"QFBundleShortVersionString", S("2.1")},
+                         {"QFBundleInfoPlistURL", S("file:///Apps/Host.app/Info.plist")},
+                         {"QSExtension", D({{"QSExtensionProtocol", S("P")}})}});
+  auto r = record(kAppexPath, info);
+  r->canonicalize();
+  r->setOriginalIdentifier("com.example.original");
+  r->setHubProtocolVersion(2);
+  r->setLastModified(-1234);
+  return r;
+}
+
+TEST(AXPlugInCoreExport, PlainRecordWritesTheElevenKeysWithTheirTypes) {
+  auto r = plainRecord();
+  value::Dictionary form = r->exportForm();
+  EXPECT_EQ(keysOf(form), kAlwaysWritten);
+  EXPECT_EQ(form.find("hubProtocolVersion")->type(), value::Type::UInt);
+  EXPECT_EQ(form.find("lastmodified")->type(), value::Type::Int);
+  EXPECT_EQ(*form.find("lastmodified"), I(-1234));
+  EXPECT_EQ(*form.find("systemResident"), B(false));
+  EXPECT_EQ(*form.find("path"), S(kAppexPath));
+  EXPECT_EQ(*form.find("version"), S("2.1"));
+  EXPECT_EQ(*form.find("uuid"), S(r->uuid()->string()));
+  EXPECT_EQ(form.find("uuid")->asString()->size(), 36u);
+  EXPECT_EQ(*form.find("annotations"), D({}));
+  EXPECT_EQ(*form.find("info"), Value::dictionary(*r->plugInDictionary()));
+}
+
+TEST(AXPlugInCoreExport, BundleInfoLeavesOutThePlistUrl) {
+  auto r = plainRecord();
+  value::Dictionary form = r->exportForm();
+  const value::Dictionary* bundleInfo = form.find("bundleInfo")->asDictionary();
+  EXPECT_FALSE(bundleInfo->find("QFBundleInfoPlistURL"));
+  EXPECT_TRUE(bundleInfo->find("QFBundleShortVersionString"));
+  EXPECT_TRUE(r->bundleInfoDictionary()->find("QFBundleInfoPlistURL"));
+}
+
+TEST(AXPlugInCoreExport, AbsentValuesAreLeftOut) {
+  auto r = AXPlugInCore::initWithName("id", AXFileURL(kBundlePath), std::nullopt, std::nullopt,
+                                      std::nullopt);
+  EXPECT_EQ(keysOf(r->exportForm()),
+            (std::set<std::string>{"hubProtocolVersion", "path", "systemResident", "identifier",
+                                   "uuid", "lastmodified", "annotations"}));
+}
+
+TEST(AXPlugInCoreForm, RoundTripKeepsEveryField) {
+  auto r = plainRecord();
+  r->setOnSystemVolume(true);
+  r->setHubProtocolVersion(4000000000u);
+  r->setContainingUrl(AXFileURL("/Apps/Host.app"));
+  r->setAnnotations(value::Dictionary{{"election", I(1)}});
+  r->setEntitlements(value::Dictionary{{"e", S("v")}});
+  r->setLocalizedName("Tool");
+  r->setLocalizedContainingName("Host");
+  value::Dictionary form = r->exportForm();
+  std::set<std::string> expectedKeys = kAlwaysWritten;
+  expectedKeys.insert(
+      {"entitlements", "containingPath", "localizedDisplayName", "localizedContainingDisplayName"});
+  EXPECT_EQ(keysOf(form), expectedKeys);
+  form = form.with("hash", Value::data({1, 2, 3})).with("requirement", S("req"));
+
+  // Through the property-list form too: unsigned integers come back as Int there.
+  for (const value::Dictionary& candidate :
+       {form, *value::PlistBridge::toPlist(Value::dictionary(form))->asDictionary()}) {
+    auto back = AXPlugInCore::initWithForm(candidate);
+    ASSERT_TRUE(back);
+    EXPECT_TRUE(*back == *r);
+    EXPECT_EQ(back->identifier(), r->identifier());
+    EXPECT_EQ(back->path(), r->path());
+    EXPECT_EQ(back->hubProtocolVersion(), 4000000000u);
+    EXPECT_EQ(back->lastModified(), -1234);
+    EXPECT_TRUE(back->onSystemVolume());
+    EXPECT_EQ(back->containingPath(), "/Apps/Host.app");
+    EXPECT_EQ(back->annotations(), r->annotations());
+    EXPECT_EQ(back->entitlements(), r->entitlements());
+    EXPECT_EQ(back->originalIdentifier(), "com.example.original");
+    EXPECT_EQ(back->localizedName(), "Tool");
+    EXPECT_EQ(back->localizedContainingName(), "Host");
+    EXPECT_FALSE(back->localizedShortName());
+    // The plug-in dictionary comes from the manifest in "bundleInfo", as it was before
+    // canonicalisation: the defaulted version stays behind in "info".
+    EXPECT_EQ(Value::dictionary(*back->plugInDictionary()), D({{"QSExtensionProtocol", S("P")}}));
+    EXPECT_FALSE(back->version());
+    EXPECT_EQ(back->cdhash(), (value::Data{1, 2, 3}));
+    EXPECT_EQ(back->requirement(), "req");
+    back->canonicalize();
+    EXPECT_EQ(back->exportForm(), r->exportForm());
+  }
+}
+
+TEST(AXPlugInCoreForm, MissingOrWrongValuesTakeTheirDefaults) {
+  value::Dictionary form = plainRecord()
+                               ->exportForm()
+                               .without("hubProtocolVersion")
+                               .without("systemResident")
+                               .without("lastmodified");
+  auto back = AXPlugInCore::initWithForm(form);
+  ASSERT_TRUE(back);
+  EXPECT_EQ(back->hubProtocolVersion(), 1u);
+  EXPECT_FALSE(back->onSystemVolume());
+  EXPECT_EQ(back->lastModified(), 0);
+
+  auto wrong = AXPlugInCore::initWithForm(form.with("hubProtocolVersion", I(-1))
+                                              .with("lastmodified", I(1ll << 40))
+                                              .with("systemResident", S("yes"))
+                                              .with("annotations", A({}))
+                                              .with("original-identifier", I(3)));
+  ASSERT_TRUE(wrong);
+  EXPECT_EQ(wrong->hubProtocolVersion(), 1u);
+  EXPECT_EQ(wrong->lastModified(), 0);
+  EXPECT_FALSE(wrong->onSystemVolume());
+  EXPECT_FALSE(wrong->annotations());
+  EXPECT_FALSE(wrong->originalIdentifier());
+}
+
+TEST(AXPlugInCoreForm, BadUuidTextGivesANewRecord) {
+  auto r = plainRecord();
+  for (const Value& uuid : {S("not-a-uuid"), I(5)}) {
+    auto back = AXPlugInCore::initWithForm(r->exportForm().with("uuid", uuid));
+    ASSERT_TRUE(back);
+    ASSERT_TRUE(back->uuid());
+    EXPECT_FALSE(*back == *r);
+  }
+  auto lowerCase = AXPlugInCore::initWithForm(
+      r->exportForm().with("uuid", S("0a0b0c0d-0e0f-4011-8213-141516171819")));
+  EXPECT_EQ(lowerCase->uuid()->string(), "0A0B0C0D-0E0F-4011-8213-141516171819");
+}
+
+TEST(AXPlugInCoreForm, SetupFailuresAreTheBaseSetupFailures) {
+  value::Dictionary form = plainRecord()->exportForm();
+  {
+    LogCapture log;
+    EXPECT_EQ(AXPlugInCore::initWithForm(form.without("path")), nullptr);
+    EXPECT_EQ(log.text(), "");
+  }
+  {
+    LogCapture log;
+    EXPECT_EQ(AXPlugInCore::initWithForm(form.without("identifier")), nullptr);
+    EXPECT_NE(log.text().find("missing identifier in plug-in at /Apps/Host.app/PlugIns/Tool.appex"),
+              std::string::npos);
+  }
+  for (const Value& bundleInfo : {S("x"), D({{"QSExtension", S("x")}})}) {
+    LogCapture log;
+    EXPECT_EQ(AXPlugInCore::initWithForm(form.with("bundleInfo", bundleInfo)), nullptr);
+    EXPECT_NE(log.text().find("malformed plug-in dictionary in plug-in com.example.tool at "
+                              "file:///Apps/Host.app/PlugIns/Tool.appex: " +
+                              bundleInfo.description()),
+              std::string::npos)
+        << log.text();
+  }
+}
+
+TEST(AXPlugInCoreForm, UpdateReplacesOrClearsAnnotations) {
+  auto r = plainRecord();
+  r->setAnnotations(value::Dictionary{{"election", I(1)}});
+  r->updateFromForm(value::Dictionary{{"annotations", D({{"election", I(2)}})}});
+  EXPECT_EQ(r->annotations(), (value::Dictionary{{"election", I(2)}}));
+  r->updateFromForm(value::Dictionary{});
+  EXPECT_FALSE(r->annotations());
+}
+
+}  // namespace

@@ -1,0 +1,191 @@
+#include <gtest/gtest.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <condition_variable>
+#include <mutex>
+
+#include "platform/registrum/Workspace.h"
+#include "tests/platform/RegistryFixture.h"
+
+extern char** environ;
+
+namespace {
+
+using registrum::PlugInList;
+using registrum::Workspace;
+using value::Value;
+
+// Collects notices; waits for them with a generous bound so that a lost notice fails the test
+// instead of hanging it.
+class Collector : public registrum::Observer {
+ public:
+  struct Notice {
+    bool install;
+    PlugInList plugIns;
+  };
+
+  void pluginsDidInstall(const PlugInList& plugIns) override { add({true, plugIns}); }
+  void pluginsWillUninstall(const PlugInList& plugIns) override { add({false, plugIns}); }
+
+  // The first |count| notices, or fewer when they do not come.
+  std::vector<Notice> await(std::size_t count) {
+    std::unique_lock lock(mutex_);
+    changed_.wait_for(lock, std::chrono::seconds(60), [&] { return notices_.size() >= count; });
+    return notices_;
+  }
+
+ private:
+  void add(Notice notice) {
+    std::lock_guard lock(mutex_);
+    notices_.push_back(std::move(notice));
+    changed_.notify_all();
+  }
+
+  std::mutex mutex_;
+  std::condition_variable changed_;
+  std::vector<Notice> notices_;
+};
+
+class WorkspaceNoticeTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    workspace_ = Workspace::open(root_.root()).value();
+    other_ = Workspace::open(root_.root()).value();  // another connection, as another process
+    root_.application("Notes.app", "com.example.notes");
+    root_.plugIn("Notes.app/PlugIns/Share.appex", "com.example.share");
+    root_.writePlist("Notes.app/PlugIns/Share.appex/Entitlements.plist",
+                     Value::dictionary({{"grant", Value::boolean(true)}}));
+  }
+
+  // Runs rgctl with |arguments| against the fixture's root; returns its exit status.
+  int rgctl(std::vector<std::string> arguments) {
+    std::vector<std::string> all = {RGCTL_PATH, "--root", root_.root()};
+    all.insert(all.end(), arguments.begin(), arguments.end());
+    std::vector<char*> argv;
+    for (auto& argument : all) argv.push_back(argument.data());
+    argv.push_back(nullptr);
+    pid_t pid = 0;
+    if (posix_spawn(&pid, RGCTL_PATH, nullptr, nullptr, argv.data(), environ) != 0) return -1;
+    int status = 0;
+    waitpid(pid, &status, 0);
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+  }
+
+  RegistryFixture root_;
+  std::shared_ptr<Workspace> workspace_;
+  std::shared_ptr<Workspace> other_;
+};
+
+TEST_F(WorkspaceNoticeTest, ObserverGetsEveryChangeOnceInOrder) {
+  auto early = std::make_shared<Collector>();
+  auto late = std::make_shared<Collector>();
+  ASSERT_TRUE(workspace_->addObserver(early).ok());
+  ASSERT_TRUE(workspace_->addObserver(early).ok());  // no second delivery
+  std::string path = root_ / "Notes.app/PlugIns/Share.appex";
+  auto first = other_->registerPlugIn(path).value();
+  ASSERT_TRUE(workspace_->addObserver(late).ok());
+  auto second = other_->registerPlugIn(path).value();
+  ASSERT_TRUE(other_->unregisterPlugIn(path).ok());
+
+  auto last = other_->registerPlugIn(path).value();
+  auto notices = early->await(4);
+  ASSERT_EQ(notices.size(), 4u);
+  EXPECT_NE(notices[3].plugIns[0]->uuid(), first->uuid());  // nothing repeated before it
+  EXPECT_EQ(notices[3].plugIns[0]->uuid(), last->uuid());
+  EXPECT_TRUE(notices[0].install);
+  EXPECT_TRUE(notices[1].install);
+  EXPECT_FALSE(notices[2].install);
+  EXPECT_EQ(notices[0].plugIns[0]->uuid(), first->uuid());
+  EXPECT_EQ(notices[1].plugIns[0]->registrationDate(), second->registrationDate());
+  const auto& removed = *notices[2].plugIns[0];
+  EXPECT_EQ(removed.uuid(), first->uuid());
+  EXPECT_EQ(removed.bundlePath(), path);
+  EXPECT_EQ(removed.bundleIdentifier(), "com.example.share");
+  EXPECT_EQ(removed.bundleVersion(), "1.0");
+  EXPECT_EQ(removed.entitlements(), first->entitlements());
+  EXPECT_EQ(removed.plugInDictionary(), first->plugInDictionary());
+  EXPECT_EQ(removed.containingApplication()->path(), root_ / "Notes.app");
+  EXPECT_EQ(late->await(3).size(), 3u);  // only the changes after it was added
+}
+
+TEST_F(WorkspaceNoticeTest, RemovedOrDestroyedObserversGetNothingMore) {
+  auto kept = std::make_shared<Collector>();
+  auto removed = std::make_shared<Collector>();
+  auto destroyed = std::make_shared<Collector>();
+  for (const auto& observer : {kept, removed, destroyed}) {
+    ASSERT_TRUE(workspace_->addObserver(observer).ok());
+  }
+  workspace_->removeObserver(removed.get());
+  std::weak_ptr<Collector> gone = destroyed;
+  destroyed.reset();
+  ASSERT_TRUE(other_->installApplication(root_ / "Notes.app").ok());
+  ASSERT_EQ(kept->await(1).size(), 1u);
+  EXPECT_EQ(kept->await(1)[0].plugIns.size(), 1u);
+  EXPECT_TRUE(removed->await(0).empty());
+  EXPECT_TRUE(gone.expired());
+}
+
+TEST_F(WorkspaceNoticeTest, ChangesByRgctlReachAnObserverHere) {
+  auto observer = std::make_shared<Collector>();
+  ASSERT_TRUE(workspace_->addObserver(observer).ok());
+  ASSERT_EQ(rgctl({"install", "--placeholder", root_ / "Notes.app"}), 0);
+  ASSERT_EQ(rgctl({"finish", root_ / "Notes.app"}), 0);
+  ASSERT_EQ(rgctl({"uninstall", root_ / "Notes.app"}), 0);
+  ASSERT_EQ(rgctl({"uninstall", root_ / "Notes.app"}), 1);
+  auto notices = observer->await(3);
+  ASSERT_EQ(notices.size(), 3u);
+  EXPECT_TRUE(notices[0].plugIns[0]->containingApplication()->isPlaceholder());
+  EXPECT_FALSE(notices[1].plugIns[0]->containingApplication()->isPlaceholder());
+  ASSERT_FALSE(notices[2].install);
+  const auto& removed = *notices[2].plugIns[0];
+  EXPECT_EQ(removed.uuid(), notices[0].plugIns[0]->uuid());
+  EXPECT_EQ(removed.plugInIdentifier(), "com.example.share");
+  EXPECT_EQ(removed.entitlements().find("grant")->asBool(), true);
+  EXPECT_TRUE(removed.dataContainerPath());
+}
+
+TEST_F(WorkspaceNoticeTest, ChangesHereReachRgctlWatchWithFullRecords) {
+  int out[2];
+  ASSERT_EQ(pipe(out), 0);
+  posix_spawn_file_actions_t actions;
+  posix_spawn_file_actions_init(&actions);
+  posix_spawn_file_actions_adddup2(&actions, out[1], STDOUT_FILENO);
+  posix_spawn_file_actions_addclose(&actions, out[0]);
+  std::string root = root_.root();
+  std::vector<std::string> all = {RGCTL_PATH, "--root", root, "watch", "--json", "--count", "2"};
+  std::vector<char*> argv;
+  for (auto& argument : all) argv.push_back(argument.data());
+  argv.push_back(nullptr);
+  pid_t pid = 0;
+  ASSERT_EQ(posix_spawn(&pid, RGCTL_PATH, &actions, nullptr, argv.data(), environ), 0);
+  posix_spawn_file_actions_destroy(&actions);
+  close(out[1]);
+  FILE* lines = fdopen(out[0], "r");
+  char line[1 << 16];
+  ASSERT_TRUE(fgets(line, sizeof line, lines));  // the observer is in place
+  EXPECT_NE(std::string(line).find("watching"), std::string::npos);
+
+  ASSERT_TRUE(workspace_->installApplication(root_ / "Notes.app").ok());
+  auto record = workspace_->plugInsWithinApplication(root_ / "Notes.app").value().at(0);
+  ASSERT_TRUE(workspace_->uninstallApplication(root_ / "Notes.app").ok());
+  std::string install = fgets(line, sizeof line, lines) ? line : "";
+  std::string uninstall = fgets(line, sizeof line, lines) ? line : "";
+  fclose(lines);
+  int status = 0;
+  waitpid(pid, &status, 0);
+  EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+
+  EXPECT_NE(install.find("\"notice\":\"install\""), std::string::npos) << install;
+  EXPECT_NE(uninstall.find("\"notice\":\"uninstall\""), std::string::npos) << uninstall;
+  for (const std::string& expected :
+       {record->uuid().string(), *record->bundlePath(), std::string("\"grant\":true"),
+        std::string("\"bundleIdentifier\":\"com.example.share\""),
+        std::string("\"version\":\"1.0\""), *record->dataContainerPath()}) {
+    EXPECT_NE(uninstall.find(expected), std::string::npos) << expected << " in " << uninstall;
+  }
+}
+
+}  // namespace

@@ -1,0 +1,401 @@
+#include <gtest/gtest.h>
+#include <sqlite3.h>
+#include <sys/stat.h>
+
+#include <filesystem>
+#include <sstream>
+
+#include "platform/registrum/Workspace.h"
+#include "tests/platform/RegistryFixture.h"
+#include "tests/platform/ScopedEnvironment.h"
+
+namespace {
+
+using registrum::PlugInRecord;
+using registrum::Workspace;
+using value::Dictionary;
+using value::Value;
+
+namespace fs = std::filesystem;
+
+class WorkspaceTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    auto opened = Workspace::open(root_.root());
+    ASSERT_TRUE(opened.ok()) << opened.error().message;
+    workspace_ = opened.value();
+  }
+
+  std::shared_ptr<const PlugInRecord> registerAt(const std::string& path,
+                                                 registrum::RegisterOptions options = {}) {
+    auto registered = workspace_->registerPlugIn(path, options);
+    EXPECT_TRUE(registered.ok()) << registered.error().message;
+    return registered.ok() ? registered.value() : nullptr;
+  }
+
+  // Everything the registry holds, placeholders included, plus the data containers on disk.
+  std::string snapshot() {
+    std::ostringstream out;
+    auto applications = workspace_->listApplications().value();
+    for (const auto& application : applications) {
+      out << application->path() << " " << application->isPlaceholder() << "\n";
+      auto plugIns = workspace_->plugInsWithinApplication(application->path()).value();
+      for (const auto& plugIn : plugIns) {
+        out << "  " << plugIn->uuid().string() << " " << *plugIn->bundlePath() << " "
+            << plugIn->registrationDate() << "\n";
+      }
+    }
+    auto plugIns = workspace_->listPlugIns().value();
+    for (const auto& plugIn : plugIns) {
+      out << plugIn->uuid().string() << " " << *plugIn->bundlePath() << "\n";
+    }
+    std::error_code ignored;
+    for (const auto& entry : fs::directory_iterator(root_ / "var/containers", ignored)) {
+      out << entry.path().string() << "\n";
+    }
+    return out.str();
+  }
+
+  RegistryFixture root_;
+  std::shared_ptr<Workspace> workspace_;
+};
+
+TEST_F(WorkspaceTest, RegistrationRecordsEveryField) {
+  std::string app = root_.application("Applications/Notes.app", "com.example.notes");
+  std::string path =
+      root_.plugIn("Applications/Notes.app/PlugIns/Share.appex", "com.example.share");
+  root_.writePlist("Applications/Notes.app/PlugIns/Share.appex/Entitlements.plist",
+                   Value::dictionary({{"org.annexa.auto-elect-plugin", Value::boolean(true)}}));
+  auto record = registerAt(path);
+  ASSERT_TRUE(record);
+
+  EXPECT_NE(record->uuid(), value::Uuid());
+  EXPECT_EQ(record->bundlePath(), path);
+  ASSERT_TRUE(record->containingApplication());
+  EXPECT_EQ(record->containingApplication()->path(), app);
+  EXPECT_EQ(record->containingApplication()->bundleIdentifier(), "com.example.notes");
+  EXPECT_FALSE(record->containingApplication()->isPlaceholder());
+  EXPECT_EQ(record->plugInIdentifier(), "com.example.share");
+  EXPECT_EQ(record->originalIdentifier(), "com.example.share");
+  EXPECT_EQ(record->bundleIdentifier(), "com.example.share");
+  EXPECT_EQ(record->bundleVersion(), "1.0");
+  EXPECT_EQ(record->extensionPointIdentifier(), "com.example.point");
+  EXPECT_EQ(record->localizedName(), "Display");
+  EXPECT_EQ(record->localizedShortName(), "Short");
+  EXPECT_EQ(record->entitlements(),
+            Dictionary({{"org.annexa.auto-elect-plugin", Value::boolean(true)}}));
+  EXPECT_GT(record->registrationDate(), 1.6e9);
+  EXPECT_FALSE(record->onSystemPartition());
+  EXPECT_EQ(record->dataContainerPath(), root_ / "var/containers/" + record->uuid().string());
+  EXPECT_TRUE(fs::is_directory(*record->dataContainerPath()));
+  EXPECT_EQ(record->valueForKey("QSExtensionVersion", PlugInRecord::Scope::Attributes),
+            Value::string("1.0"));
+  EXPECT_FALSE(record->infoDictionary()
+                   .find("QSExtension")
+                   ->asDictionary()
+                   ->find("QSExtensionAttributes"));  // the raw Info.plist, before resolution
+
+  auto byUuid = workspace_->plugInForUuid(record->uuid()).value();
+  auto byPath = workspace_->plugInAtPath(path + "/").value();
+  ASSERT_TRUE(byUuid && byPath);
+  EXPECT_EQ(byUuid->fields().plugInDictionary, record->plugInDictionary());
+  EXPECT_EQ(byUuid->entitlements(), record->entitlements());
+  EXPECT_EQ(byUuid->registrationDate(), record->registrationDate());
+  EXPECT_EQ(byPath->uuid(), record->uuid());
+  EXPECT_EQ(workspace_->applicationAtPath(app).value()->localizedName(), "App");
+  EXPECT_EQ(workspace_->plugInsWithinApplication(app).value().size(), 1u);
+}
+
+TEST_F(WorkspaceTest, ValueForKeyLooksInTheNamedScope) {
+  auto record = registerAt(
+      root_.plugIn("P.appex", "p", "pt",
+                   {{"QSExtensionAttributes", Value::dictionary({{"k", Value::integer(1)}})}}));
+  ASSERT_TRUE(record);
+  EXPECT_EQ(record->valueForKey("k", PlugInRecord::Scope::Attributes), Value::integer(1));
+  EXPECT_FALSE(record->valueForKey("k", PlugInRecord::Scope::PlugInDictionary));
+  EXPECT_EQ(
+      record->valueForKey("QSExtensionPointIdentifier", PlugInRecord::Scope::PlugInDictionary),
+      Value::string("pt"));
+  EXPECT_EQ(record->valueForKey("QFBundleIdentifier", PlugInRecord::Scope::InfoDictionary),
+            Value::string("p"));
+  PlugInRecord bare(PlugInRecord::Fields{});
+  EXPECT_FALSE(bare.valueForKey("k", PlugInRecord::Scope::Attributes));
+}
+
+TEST_F(WorkspaceTest, SystemVolumeAndStandalonePlugIns) {
+  auto system = registerAt(root_.plugIn("System/Library/PlugIns/Tool.appex", "tool"));
+  auto lookalike = registerAt(root_.plugIn("Systemic/Tool.appex", "tool2"));
+  ASSERT_TRUE(system && lookalike);
+  EXPECT_TRUE(system->onSystemPartition());
+  EXPECT_FALSE(system->containingApplication());
+  EXPECT_FALSE(lookalike->onSystemPartition());
+  EXPECT_TRUE(workspace_->listApplications().value().empty());
+}
+
+TEST_F(WorkspaceTest, IdentifiersAndEncodings) {
+  auto binary = registerAt(root_.plugIn("Bin.appex", "com.example.bin", "pt", {}, true));
+  auto named = registerAt(root_.plugIn("Named.appex", "bundle.id", "pt",
+                                       {{"QSExtensionIdentifier", Value::string("plugin.id")}}));
+  root_.writePlist("Anonymous.appex/Info.plist",
+                   Value::dictionary({{"QSExtension", Value::dictionary({})}}));
+  auto anonymous = registerAt(root_ / "Anonymous.appex");
+  ASSERT_TRUE(binary && named && anonymous);
+  EXPECT_EQ(binary->plugInIdentifier(), "com.example.bin");
+  EXPECT_EQ(named->plugInIdentifier(), "plugin.id");
+  EXPECT_EQ(named->bundleIdentifier(), "bundle.id");
+  EXPECT_FALSE(anonymous->plugInIdentifier());
+  EXPECT_FALSE(anonymous->bundleVersion());
+  EXPECT_FALSE(anonymous->localizedName());
+  EXPECT_EQ(anonymous->valueForKey("QSExtensionVersion", PlugInRecord::Scope::Attributes),
+            Value::string("1"));
+}
+
+TEST_F(WorkspaceTest, PlugInOfAnApplicationWithoutInfoPlistRegistersTheApplication) {
+  auto record = registerAt(root_.plugIn("Bare.app/PlugIns/P.appex", "p"));
+  ASSERT_TRUE(record && record->containingApplication());
+  EXPECT_EQ(record->containingApplication()->path(), root_ / "Bare.app");
+  EXPECT_FALSE(record->containingApplication()->bundleIdentifier());
+}
+
+TEST_F(WorkspaceTest, ReRegistrationKeepsTheUuidAndRefreshesFields) {
+  std::string path = root_.plugIn("P.appex", "p");
+  auto first = registerAt(path);
+  ASSERT_TRUE(first);
+  root_.writePlist("P.appex/Info.plist",
+                   Value::dictionary({{"QFBundleIdentifier", Value::string("p")},
+                                      {"QFBundleShortVersionString", Value::string("2.0")},
+                                      {"QSExtension", Value::dictionary({})}}));
+  auto second = registerAt(path);
+  ASSERT_TRUE(second);
+  EXPECT_EQ(second->uuid(), first->uuid());
+  EXPECT_EQ(second->bundleVersion(), "2.0");
+  EXPECT_GE(second->registrationDate(), first->registrationDate());
+  EXPECT_EQ(second->dataContainerPath(), first->dataContainerPath());
+  EXPECT_EQ(workspace_->listPlugIns().value().size(), 1u);
+
+  auto third = registerAt(path, {.dataContainer = false});
+  ASSERT_TRUE(third);
+  EXPECT_EQ(third->uuid(), first->uuid());
+  EXPECT_FALSE(third->dataContainerPath());
+  EXPECT_FALSE(fs::exists(*first->dataContainerPath()));
+  EXPECT_FALSE(workspace_->plugInForUuid(first->uuid()).value()->dataContainerPath());
+}
+
+TEST_F(WorkspaceTest, UnregisterRemovesRecordAndContainerEvenWhenTheBundleIsGone) {
+  std::string path = root_.plugIn("Gone.app/PlugIns/P.appex", "p");
+  auto record = registerAt(path);
+  ASSERT_TRUE(record);
+  fs::remove_all(root_ / "Gone.app");
+  ASSERT_TRUE(workspace_->unregisterPlugIn(path).ok());
+  EXPECT_FALSE(workspace_->plugInForUuid(record->uuid()).value());
+  EXPECT_FALSE(fs::exists(*record->dataContainerPath()));
+  EXPECT_TRUE(workspace_->applicationAtPath(root_ / "Gone.app").value());  // the app stays
+
+  os::Status again = workspace_->unregisterPlugIn(path);
+  ASSERT_FALSE(again.ok());
+  EXPECT_EQ(again.error().errnum, ENOENT);
+}
+
+TEST_F(WorkspaceTest, BadBundlesFailAndLeaveTheRegistryUnchanged) {
+  registerAt(root_.plugIn("Good.app/PlugIns/P.appex", "p"));
+  root_.writeFile("Malformed.appex/Info.plist", "<plist><dict><key>x</key>");
+  root_.writePlist("NoExtension.appex/Info.plist",
+                   Value::dictionary({{"QFBundleIdentifier", Value::string("n")}}));
+  root_.writePlist("WrongExtension.appex/Info.plist",
+                   Value::dictionary({{"QSExtension", Value::string("n")}}));
+  root_.writePlist("ArrayInfo.appex/Info.plist", Value::array({}));
+  root_.plugIn("BadEntitlements.appex", "e");
+  root_.writeFile("BadEntitlements.appex/Entitlements.plist", "garbage");
+  root_.writeFile("File.appex", "not a directory");
+  fs::create_directories(root_ / "Empty.appex");
+  std::string before = snapshot();
+
+  struct Case {
+    const char* path;
+    int errnum;
+  };
+  for (Case c : {Case{"Malformed.appex", EINVAL}, Case{"NoExtension.appex", EINVAL},
+                 Case{"WrongExtension.appex", EINVAL}, Case{"ArrayInfo.appex", EINVAL},
+                 Case{"BadEntitlements.appex", EINVAL}, Case{"File.appex", ENOTDIR},
+                 Case{"Empty.appex", ENOENT}, Case{"Missing.appex", ENOENT}}) {
+    auto result = workspace_->registerPlugIn(root_ / c.path);
+    ASSERT_FALSE(result.ok()) << c.path;
+    EXPECT_EQ(result.error().errnum, c.errnum) << c.path << ": " << result.error().message;
+    EXPECT_NE(result.error().message.find(c.path), std::string::npos) << result.error().message;
+  }
+  EXPECT_EQ(snapshot(), before);
+}
+
+TEST_F(WorkspaceTest, FailedInstallsLeaveTheRegistryUnchanged) {
+  std::string app = root_.application("A.app", "a");
+  root_.plugIn("A.app/PlugIns/One.appex", "one");
+  ASSERT_TRUE(workspace_->installApplication(app).ok());
+  root_.application("B.app", "b");
+  root_.plugIn("B.app/PlugIns/Good.appex", "good");
+  root_.writeFile("B.app/PlugIns/Zbad.appex/Info.plist", "not a plist");
+  fs::create_directories(root_ / "NoInfo.app");
+  fs::create_directories(root_ / "NotAnApp");
+  std::string before = snapshot();
+
+  auto duplicate = workspace_->installApplication(app);
+  ASSERT_FALSE(duplicate.ok());
+  EXPECT_EQ(duplicate.error().errnum, EEXIST);
+  auto broken = workspace_->installApplication(root_ / "B.app");
+  ASSERT_FALSE(broken.ok());
+  EXPECT_NE(broken.error().message.find("Zbad.appex"), std::string::npos);
+  EXPECT_EQ(workspace_->installApplication(root_ / "NoInfo.app").error().errnum, ENOENT);
+  EXPECT_EQ(workspace_->installApplication(root_ / "NotAnApp").error().errnum, EINVAL);
+  EXPECT_EQ(snapshot(), before);
+}
+
+TEST_F(WorkspaceTest, AFailureInsideTheTransactionRollsBackEarlierWrites) {
+  registerAt(root_.plugIn("Kept.appex", "kept"));
+  std::string app = root_.application("A.app", "a");
+  root_.plugIn("A.app/PlugIns/One.appex", "one");
+  fs::remove_all(root_ / "var/containers");
+  root_.writeFile("var/containers", "a file where the containers belong");
+  std::string before = snapshot();
+  EXPECT_EQ(workspace_->installApplication(app).error().errnum, ENOTDIR);
+  EXPECT_EQ(workspace_->registerPlugIn(root_ / "A.app/PlugIns/One.appex").error().errnum, ENOTDIR);
+  EXPECT_EQ(snapshot(), before);
+  EXPECT_FALSE(workspace_->applicationAtPath(app).value());
+}
+
+TEST_F(WorkspaceTest, PlaceholderPlugInsAreHiddenUntilFinished) {
+  std::string app = root_.application("Beta.app", "beta");
+  root_.plugIn("Beta.app/PlugIns/One.appex", "one");
+  root_.plugIn("Beta.app/PlugIns/Two.appex", "two");
+  root_.writeFile("Beta.app/PlugIns/README", "not a bundle");
+  auto installed = workspace_->installApplication(app, {.placeholder = true});
+  ASSERT_TRUE(installed.ok()) << installed.error().message;
+  EXPECT_TRUE(installed.value()->isPlaceholder());
+  registerAt(root_.plugIn("Visible.appex", "one"));
+
+  auto within = workspace_->plugInsWithinApplication(app).value();
+  ASSERT_EQ(within.size(), 2u);
+  EXPECT_EQ(within[0]->plugInIdentifier(), "one");
+  EXPECT_TRUE(within[0]->containingApplication()->isPlaceholder());
+  EXPECT_EQ(workspace_->listPlugIns().value().size(), 1u);
+  EXPECT_EQ(workspace_->query({}, nullptr).value().size(), 1u);
+  EXPECT_TRUE(workspace_->plugInForUuid(within[1]->uuid()).value());
+  EXPECT_TRUE(workspace_->plugInAtPath(*within[1]->bundlePath()).value());
+
+  ASSERT_TRUE(workspace_->finishInstallation(app).ok());
+  EXPECT_EQ(workspace_->listPlugIns().value().size(), 3u);
+  EXPECT_FALSE(workspace_->plugInForUuid(within[1]->uuid())
+                   .value()
+                   ->containingApplication()
+                   ->isPlaceholder());
+  EXPECT_EQ(workspace_->finishInstallation(app).error().errnum, EINVAL);
+  EXPECT_EQ(workspace_->finishInstallation(root_ / "Unknown.app").error().errnum, ENOENT);
+}
+
+TEST_F(WorkspaceTest, UninstallRemovesTheApplicationWithItsPlugIns) {
+  std::string app = root_.application("A.app", "a");
+  root_.plugIn("A.app/PlugIns/One.appex", "one");
+  ASSERT_TRUE(workspace_->installApplication(app, {.dataContainer = false}).ok());
+  auto plugIns = workspace_->plugInsWithinApplication(app).value();
+  ASSERT_EQ(plugIns.size(), 1u);
+  EXPECT_FALSE(plugIns[0]->dataContainerPath());
+  ASSERT_TRUE(workspace_->uninstallApplication(app).ok());
+  EXPECT_FALSE(workspace_->applicationAtPath(app).value());
+  EXPECT_FALSE(workspace_->plugInForUuid(plugIns[0]->uuid()).value());
+  EXPECT_EQ(workspace_->uninstallApplication(app).error().errnum, ENOENT);
+}
+
+TEST_F(WorkspaceTest, QueryPreselectsPlainStringsAndHonoursTheFilter) {
+  registerAt(root_.plugIn("A.appex", "a", "point.one"));
+  registerAt(root_.plugIn("B.appex", "b", "point.two"));
+  root_.writePlist("NoPoint.appex/Info.plist",
+                   Value::dictionary({{"QFBundleIdentifier", Value::string("c")},
+                                      {"QSExtension", Value::dictionary({})}}));
+  registerAt(root_ / "NoPoint.appex");
+  root_.plugIn("Attr.appex", "d", "point.two",
+               {{"QSExtensionAttributes",
+                 Value::dictionary({{"QSExtensionPointIdentifier", Value::string("point.one")}})}});
+  registerAt(root_ / "Attr.appex");
+  auto identifiers = [&](const Dictionary& rule, const Workspace::Filter& filter = nullptr) {
+    std::string out;
+    auto records = workspace_->query(rule, filter).value();
+    for (const auto& record : records) {
+      out += record->plugInIdentifier().value_or("?");
+    }
+    return out;
+  };
+  EXPECT_EQ(identifiers({}), "adbc");
+  EXPECT_EQ(identifiers({{"QSExtensionIdentifier", Value::string("b")}}), "b");
+  EXPECT_EQ(identifiers({{"QSExtensionIdentifier", Value::string("=b")}}), "b");
+  EXPECT_EQ(identifiers({{"QSExtensionIdentifier", Value::string("<>b")}}), "adbc");
+  EXPECT_EQ(identifiers({{"QSExtensionIdentifier", Value::array({Value::string("b")})}}), "adbc");
+  // The attribute is what a rule sees, and plug-ins without an extension point stay candidates.
+  EXPECT_EQ(identifiers({{"QSExtensionPointIdentifier", Value::string("point.one")}}), "adc");
+  EXPECT_EQ(identifiers({{"QSExtensionPointIdentifier", Value::string("point.two")},
+                         {"QSExtensionIdentifier", Value::string("b")}}),
+            "b");
+
+  std::vector<std::string> seen;
+  auto filter = [&](const std::string& identifier, const Dictionary& entitlements) {
+    seen.push_back(identifier);
+    EXPECT_TRUE(entitlements.empty());
+    return identifier != "a";
+  };
+  EXPECT_EQ(identifiers({}, filter), "dbc");
+  EXPECT_EQ(seen, (std::vector<std::string>{"a", "d", "b", "c"}));
+}
+
+TEST_F(WorkspaceTest, FilterSeesEntitlements) {
+  root_.plugIn("E.appex", "e");
+  root_.writePlist("E.appex/Entitlements.plist",
+                   Value::dictionary({{"grant", Value::string("yes")}}));
+  registerAt(root_ / "E.appex");
+  registerAt(root_.plugIn("F.appex", "f"));
+  auto kept = workspace_->query({}, [](const std::string&, const Dictionary& entitlements) {
+    return entitlements.find("grant") != nullptr;
+  });
+  ASSERT_EQ(kept.value().size(), 1u);
+  EXPECT_EQ(kept.value()[0]->plugInIdentifier(), "e");
+}
+
+TEST_F(WorkspaceTest, ReopeningKeepsRecordsAndUnknownSchemaIsRefused) {
+  auto record = registerAt(root_.plugIn("P.appex", "p"));
+  workspace_->clearCaches();
+  auto reopened = Workspace::open(root_.root());
+  ASSERT_TRUE(reopened.ok());
+  EXPECT_EQ(reopened.value()->plugInForUuid(record->uuid()).value()->bundlePath(),
+            record->bundlePath());
+
+  sqlite3* db = nullptr;
+  ASSERT_EQ(sqlite3_open((root_ / "var/db/registrum.sqlite").c_str(), &db), SQLITE_OK);
+  sqlite3_busy_timeout(db, 10000);
+  ASSERT_EQ(sqlite3_exec(db, "UPDATE schema_version SET version = 99", nullptr, nullptr, nullptr),
+            SQLITE_OK);
+  sqlite3_close(db);
+  auto refused = Workspace::open(root_.root());
+  ASSERT_FALSE(refused.ok());
+  EXPECT_EQ(refused.error().errnum, EIO);
+  EXPECT_NE(refused.error().message.find("99"), std::string::npos);
+}
+
+TEST_F(WorkspaceTest, DefaultWorkspaceIsSharedPerRoot) {
+  ScopedEnvironment environment;
+  environment.set("ANNEXA_ROOT", root_.root());
+  auto first = Workspace::defaultWorkspace();
+  auto second = Workspace::defaultWorkspace();
+  ASSERT_TRUE(first.ok() && second.ok());
+  EXPECT_EQ(first.value(), second.value());
+  RegistryFixture other;
+  environment.set("ANNEXA_ROOT", other.root());
+  auto third = Workspace::defaultWorkspace();
+  ASSERT_TRUE(third.ok());
+  EXPECT_NE(third.value(), first.value());
+}
+
+TEST_F(WorkspaceTest, UnusableRootFails) {
+  RegistryFixture other;
+  std::string file = other.writeFile("file", "x");
+  auto opened = Workspace::open(file);
+  ASSERT_FALSE(opened.ok());
+  EXPECT_EQ(opened.error().errnum, ENOTDIR);
+}
+
+}  // namespace

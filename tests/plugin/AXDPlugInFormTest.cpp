@@ -1,0 +1,205 @@
+#include <gtest/gtest.h>
+
+#include <thread>
+#include <vector>
+
+#include "axd/AXDPlugIn.h"
+#include "platform/sandbox/GrantTable.h"
+#include "platform/sandbox/Sandbox.h"
+#include "tests/annexa/LogCapture.h"
+#include "tests/plugin/DeviceRoot.h"
+#include "tests/plugin/RegistryRecords.h"
+
+namespace {
+
+using namespace records;
+using registrum::PlugInRecord;
+
+// Plug-ins in a real application on a fresh device root, so their resources can be shared.
+class AXDPlugInFormTest : public DeviceRootTest {
+ protected:
+  void SetUp() override {
+    DeviceRootTest::SetUp();
+    app_ = canonical(directory("Apps/Host.app"));
+    directory("Apps/Host.app/PlugIns/Tool.appex/Resources");
+    directory("Apps/Host.app/PlugIns/Tool.bundle/Resources");
+  }
+
+  std::shared_ptr<AXDPlugIn> inApp(const std::string& name,
+                                   std::optional<value::Value> shared = std::nullopt) {
+    PlugInRecord::Fields fields = plugIn(app_ + "/PlugIns/" + name);
+    fields.containingApplication = application(app_);
+    if (shared) fields.plugInDictionary = fields.plugInDictionary.with("Shared", *shared);
+    return build(fields);
+  }
+
+  // The path of the grant |token| gives when consumed.
+  static std::string grantedPath(const value::Value* token) {
+    if (!token || !token->asString()) return "no token";
+    os::Result<std::int64_t> handle = sandbox::Sandbox::consume(*token->asString());
+    if (!handle.ok()) return handle.error().message;
+    std::string path = sandbox::GrantTable::shared().find(handle.value())->path();
+    sandbox::Sandbox::release(handle.value());
+    return path;
+  }
+
+  static value::Dictionary extensionsOf(const value::Dictionary& form) {
+    const value::Value* extensions = form.find("extensions");
+    return extensions && extensions->asDictionary() ? *extensions->asDictionary()
+                                                    : value::Dictionary{{"absent", S("")}};
+  }
+
+  std::string app_;
+};
+
+TEST_F(AXDPlugInFormTest, AnAppExtensionSharesItsWholeBundleOnly) {
+  auto record = inApp("Tool.appex", A({S("Resources")}));
+  ASSERT_TRUE(record);
+  value::Dictionary form = record->augmentForm(record->exportForm());
+  value::Dictionary extensions = extensionsOf(form);
+  ASSERT_EQ(extensions.size(), 1u);
+  EXPECT_EQ(grantedPath(extensions.find(".")), record->path());
+  ASSERT_TRUE(form.find("identifier"));
+  EXPECT_EQ(*form.find("identifier"), S(kIdentifier));
+}
+
+TEST_F(AXDPlugInFormTest, APlugInWithoutSharedResourcesGetsNothing) {
+  auto record = inApp("Tool.bundle");
+  ASSERT_TRUE(record);
+  value::Dictionary form{{"identifier", S(kIdentifier)}};
+  EXPECT_EQ(record->augmentForm(form), form);
+}
+
+TEST_F(AXDPlugInFormTest, SharedResourcesAreExtensionsInsideTheBundle) {
+  auto single = inApp("Tool.bundle", S("Resources"));
+  ASSERT_TRUE(single);
+  value::Dictionary extensions = extensionsOf(single->augmentForm({}));
+  ASSERT_EQ(extensions.size(), 1u);
+  EXPECT_EQ(grantedPath(extensions.find("Resources")), single->path() + "/Resources");
+
+  auto none = inApp("Tool.bundle", A({}));
+  EXPECT_EQ(none->augmentForm({}), (value::Dictionary{{"extensions", D({})}}));
+  EXPECT_TRUE(none->issueResourceExtensions(D({{"Resources", S("x")}})).empty());
+}
+
+TEST_F(AXDPlugInFormTest, AResourceThatCannotBeSharedIsLeftOutAndLogged) {
+  auto record = inApp("Tool.bundle", A({S("Missing"), value::Value::integer(7), S("Resources")}));
+  ASSERT_TRUE(record);
+  LogCapture log;
+  value::Dictionary extensions = extensionsOf(record->augmentForm({}));
+  EXPECT_EQ(extensions.size(), 1u);
+  EXPECT_EQ(grantedPath(extensions.find("Resources")), record->path() + "/Resources");
+  EXPECT_NE(
+      log.text().find("failed to make extension for " + record->path() + "/Missing in plug-in at " +
+                      record->path() + ": No such file or directory"),
+      std::string::npos)
+      << log.text();
+}
+
+class AXDPlugInEntitlementTest : public ::testing::Test {
+ protected:
+  static std::shared_ptr<AXDPlugIn> withEntitlements(value::Dictionary entitlements) {
+    PlugInRecord::Fields fields = plugIn("/Apps/Host.app/PlugIns/Tool.appex");
+    fields.containingApplication = application("/Apps/Host.app");
+    fields.entitlements = std::move(entitlements);
+    return build(fields);
+  }
+};
+
+TEST_F(AXDPlugInEntitlementTest, AnEntitlementIsHeldWhenPresentAndNotFalse) {
+  auto record = withEntitlements({
+      {"no", value::Value::boolean(false)},
+      {"yes", value::Value::boolean(true)},
+      {"text", S("")},
+      {"zero", value::Value::integer(0)},
+      {"realZero", value::Value::real(0.0)},
+      {"one", value::Value::unsignedInteger(1)},
+      {"half", value::Value::real(0.5)},
+      {"dictionary", D({})},
+  });
+  ASSERT_TRUE(record);
+  EXPECT_FALSE(record->hasEntitlement("absent"));
+  EXPECT_FALSE(record->hasEntitlement("no"));
+  EXPECT_FALSE(record->hasEntitlement("zero"));
+  EXPECT_FALSE(record->hasEntitlement("realZero"));
+  for (const char* held : {"yes", "text", "one", "half", "dictionary"}) {
+    EXPECT_TRUE(record->hasEntitlement(held)) << held;
+  }
+  EXPECT_EQ(record->valueForEntitlement("text"), S(""));
+  EXPECT_FALSE(record->valueForEntitlement("absent"));
+}
+
+TEST_F(AXDPlugInEntitlementTest, TheAnnotationKeyIsTheReplacedPlugInWhenNamed) {
+  const std::string replace = std::string(AXD_VENDOR_PREFIX) + ".developer.replace-plugin";
+  EXPECT_EQ(withEntitlements({{replace, S("com.example.old")}})->annotationKey(),
+            "com.example.old");
+  EXPECT_EQ(withEntitlements({})->annotationKey(), kIdentifier);
+  EXPECT_EQ(withEntitlements({{replace, value::Value::boolean(true)}})->annotationKey(),
+            kIdentifier);
+}
+
+TEST(AXDPlugInPruneTest, KeysBeginningWithDTAreDropped) {
+  value::Dictionary info{{"DTSDKName", S("sdk")}, {"DT", S("")},       {"QFBundleName", S("n")},
+                         {"dt", S("lower")},      {"XDTKey", S("in")}, {"D", S("d")}};
+  value::Dictionary pruned = AXDPlugIn::prunedInfoDictionaryFor(info);
+  EXPECT_EQ(pruned,
+            (value::Dictionary{
+                {"QFBundleName", S("n")}, {"dt", S("lower")}, {"XDTKey", S("in")}, {"D", S("d")}}));
+  EXPECT_EQ(info.size(), 6u);
+}
+
+class AXDPlugInNameTest : public AXDPlugInEntitlementTest {
+ protected:
+  static std::shared_ptr<AXDPlugIn> named(std::optional<std::string> name,
+                                          std::optional<std::string> shortName) {
+    PlugInRecord::Fields fields = plugIn("/Apps/Host.app/PlugIns/Tool.appex");
+    fields.containingApplication = application("/Apps/Host.app");
+    fields.localizedName = std::move(name);
+    fields.localizedShortName = std::move(shortName);
+    return build(fields);
+  }
+};
+
+TEST_F(AXDPlugInNameTest, DisplayNamesComeFromTheRegistryUnlessSet) {
+  auto record = named("Tool", "T");
+  ASSERT_TRUE(record);
+  EXPECT_EQ(record->localizedName(), "Tool");
+  EXPECT_EQ(record->localizedShortName(), "T");
+  EXPECT_EQ(record->localizedContainingName(), "Host");
+  value::Dictionary form = record->exportForm();
+  ASSERT_TRUE(form.find("localizedDisplayName"));
+  EXPECT_EQ(*form.find("localizedDisplayName"), S("Tool"));
+
+  auto preset = named("Tool", "T");
+  preset->setLocalizedName("Mine");
+  EXPECT_EQ(preset->localizedName(), "Mine");
+}
+
+TEST_F(AXDPlugInNameTest, AnAbsentNameLeavesTheCacheEmpty) {
+  auto record = named(std::nullopt, std::nullopt);
+  ASSERT_TRUE(record);
+  EXPECT_FALSE(record->localizedName());
+  EXPECT_FALSE(record->localizedShortName());
+  record->setLocalizedShortName("Later");
+  EXPECT_EQ(record->localizedShortName(), "Later");
+}
+
+TEST_F(AXDPlugInNameTest, ConcurrentFirstReadsAgree) {
+  for (int round = 0; round < 20; ++round) {
+    auto record = named("Tool", "T");
+    ASSERT_TRUE(record);
+    std::vector<std::string> seen(8);
+    std::vector<std::thread> readers;
+    for (std::size_t i = 0; i < seen.size(); ++i) {
+      readers.emplace_back([&, i] {
+        seen[i] = record->localizedName().value_or("") + "/" +
+                  record->localizedShortName().value_or("") + "/" +
+                  record->localizedContainingName().value_or("");
+      });
+    }
+    for (std::thread& reader : readers) reader.join();
+    for (const std::string& names : seen) EXPECT_EQ(names, "Tool/T/Host");
+  }
+}
+
+}  // namespace

@@ -1,0 +1,172 @@
+#include <gtest/gtest.h>
+
+#include <limits>
+
+#include "axd/AXDPlugIn.h"
+#include "tests/annexa/LogCapture.h"
+#include "tests/platform/ScopedEnvironment.h"
+#include "tests/plugin/RegistryRecords.h"
+
+namespace {
+
+using namespace records;
+using registrum::PlugInRecord;
+
+constexpr const char* kSystemPath = "/System/Library/Tool.appex";
+
+class AXDPlugInTest : public ::testing::Test {
+ protected:
+  void SetUp() override { environment_.unset("ANNEXA_ROOT"); }
+
+  // What initWithRGData logged for |fields| when it refused them; "" when it made a record.
+  static std::string refusal(PlugInRecord::Fields fields) {
+    LogCapture log;
+    return build(std::move(fields)) ? "" : log.text();
+  }
+
+  static std::string ignoring(const std::string& path, const std::string& message) {
+    return "ignoring mis-configured plug-in at " + path + ": Error Domain=Annexa Code=12 \"" +
+           message + "\"";
+  }
+
+  ScopedEnvironment environment_;
+};
+
+TEST_F(AXDPlugInTest, TheRecordTakesItsFactsFromTheRegistry) {
+  PlugInRecord::Fields fields = plugIn(kSystemPath);
+  fields.originalIdentifier = "com.example.original";
+  fields.entitlements = value::Dictionary{{"e", value::Value::boolean(true)}};
+  fields.onSystemPartition = true;
+  value::Uuid uuid = fields.uuid;
+  auto record = build(fields);
+  ASSERT_TRUE(record);
+  EXPECT_EQ(record->identifier(), kIdentifier);
+  EXPECT_EQ(record->path(), kSystemPath);
+  EXPECT_EQ(record->uuid(), uuid);
+  EXPECT_EQ(record->originalIdentifier(), "com.example.original");
+  EXPECT_EQ(record->entitlements(), fields.entitlements);
+  EXPECT_TRUE(record->onSystemVolume());
+  EXPECT_EQ(record->plugInDictionary(), fields.plugInDictionary);
+  EXPECT_EQ(record->bundleInfoDictionary(), fields.infoDictionary);
+  EXPECT_FALSE(record->containingUrl());
+  EXPECT_EQ(record->rgproxy()->uuid(), uuid);
+}
+
+TEST_F(AXDPlugInTest, LookupsAskTheRegistryRecord) {
+  PlugInRecord::Fields fields = plugIn(kSystemPath);
+  // The raw Info.plist and the resolved plug-in dictionary differ, as after an SDK merge.
+  fields.infoDictionary = fields.infoDictionary.with("Raw", S("info"));
+  fields.plugInDictionary = fields.plugInDictionary.with("Resolved", S("sdk"));
+  auto record = build(fields);
+  ASSERT_TRUE(record);
+  EXPECT_EQ(record->infoKey("Raw"), S("info"));
+  EXPECT_FALSE(record->infoKey("Resolved"));
+  EXPECT_EQ(record->pluginKey("Resolved"), S("sdk"));
+  EXPECT_EQ(record->attribute("QSExtensionVersion"), S("1.0"));
+  EXPECT_EQ(record->version(), "1.0");
+  EXPECT_EQ(record->protocolSpec(), S("ToolProtocol"));
+  EXPECT_FALSE(record->attribute("missing"));
+}
+
+TEST_F(AXDPlugInTest, HubProtocolVersionComesFromTheManifestElseFromItsStyle) {
+  auto version = [](std::optional<value::Value> declared, bool legacy) {
+    PlugInRecord::Fields fields = plugIn(kSystemPath);
+    if (declared)
+      fields.plugInDictionary = fields.plugInDictionary.with("HubProtocolVersion", *declared);
+    if (legacy) fields.infoDictionary = fields.infoDictionary.with("Annexa", D({}));
+    auto record = build(fields);
+    return record ? record->hubProtocolVersion() : 0u;
+  };
+  EXPECT_EQ(version(value::Value::integer(3), false), 3u);
+  EXPECT_EQ(version(value::Value::unsignedInteger(3), true), 3u);
+  EXPECT_EQ(version(std::nullopt, false), 2u);
+  EXPECT_EQ(version(std::nullopt, true), 1u);
+  // Values that are no unsigned 32-bit number count as absent.
+  EXPECT_EQ(version(S("3"), false), 2u);
+  EXPECT_EQ(version(value::Value::integer(-1), true), 1u);
+  EXPECT_EQ(version(value::Value::integer(std::int64_t{1} << 32), false), 2u);
+}
+
+TEST_F(AXDPlugInTest, RegistrationDateDropsTheFraction) {
+  auto lastModified = [](double date) {
+    PlugInRecord::Fields fields = plugIn(kSystemPath);
+    fields.registrationDate = date;
+    return build(fields)->lastModified();
+  };
+  EXPECT_EQ(lastModified(1000.9), 1000);
+  EXPECT_EQ(lastModified(-1.5), -1);
+  EXPECT_EQ(lastModified(1e12), std::numeric_limits<std::int32_t>::max());
+}
+
+TEST_F(AXDPlugInTest, ANilUuidIsReplacedByARandomOne) {
+  PlugInRecord::Fields fields = plugIn(kSystemPath);
+  fields.uuid = value::Uuid();
+  auto first = build(fields);
+  auto second = build(fields);
+  ASSERT_TRUE(first && second);
+  EXPECT_NE(first->uuid(), value::Uuid());
+  EXPECT_FALSE(first->isEqual(*second));
+}
+
+TEST_F(AXDPlugInTest, NoBundleLocationOrIdentifierGivesNoRecord) {
+  PlugInRecord::Fields noPath = plugIn(kSystemPath);
+  noPath.bundlePath.reset();
+  EXPECT_EQ(refusal(noPath), "");
+  EXPECT_FALSE(build(noPath));
+  EXPECT_FALSE(AXDPlugIn::initWithRGData(nullptr));
+
+  PlugInRecord::Fields noIdentifier = plugIn(kSystemPath);
+  noIdentifier.plugInIdentifier.reset();
+  EXPECT_NE(
+      refusal(noIdentifier).find(std::string("missing identifier in plug-in at ") + kSystemPath),
+      std::string::npos);
+}
+
+TEST_F(AXDPlugInTest, OutsideApplicationsOnlyTheSystemVolumeServes) {
+  EXPECT_EQ(refusal(plugIn(kSystemPath)), "");
+  const std::string outside = "plug-ins outside containing apps must be in /System";
+  for (const char* path : {"/var/Tool.appex", "/SystemTool.appex", "/Apps/System/Tool.appex"}) {
+    EXPECT_NE(refusal(plugIn(path)).find(ignoring(path, outside)), std::string::npos) << path;
+  }
+  PlugInRecord::Fields contained = plugIn("/var/Host.app/PlugIns/Tool.appex");
+  contained.containingApplication = application("/var/Host.app");
+  auto record = build(contained);
+  ASSERT_TRUE(record);
+  EXPECT_EQ(record->containingPath(), "/var/Host.app");
+}
+
+TEST_F(AXDPlugInTest, TheSystemVolumeLiesUnderTheDeviceRoot) {
+  environment_.set("ANNEXA_ROOT", "/device/");
+  EXPECT_TRUE(build(plugIn("/device/System/Library/Tool.appex")));
+  EXPECT_FALSE(build(plugIn(kSystemPath)));
+}
+
+TEST_F(AXDPlugInTest, OnlyDataPlugInsMayLackADataContainer) {
+  const std::string noContainer = "this plug-in has no sandbox data container";
+  PlugInRecord::Fields data = plugIn(kSystemPath);
+  data.dataContainerPath.reset();
+  data.plugInDictionary = data.plugInDictionary.with("QSExtensionProtocol", S("#Data"));
+  EXPECT_EQ(refusal(data), "");
+
+  PlugInRecord::Fields code = plugIn(kSystemPath);
+  code.dataContainerPath.reset();
+  EXPECT_NE(refusal(code).find(ignoring(kSystemPath, noContainer)), std::string::npos);
+
+  // Failing both checks reports the container first.
+  PlugInRecord::Fields both = plugIn("/var/Tool.appex");
+  both.dataContainerPath.reset();
+  EXPECT_NE(refusal(both).find(ignoring("/var/Tool.appex", noContainer)), std::string::npos);
+}
+
+TEST_F(AXDPlugInTest, TheBaseChecksComeFirst) {
+  PlugInRecord::Fields fields = plugIn("/var/Tool.appex");
+  fields.dataContainerPath.reset();
+  fields.plugInDictionary = fields.plugInDictionary.with("PassProxy", value::Value::boolean(true));
+  std::string log = refusal(fields);
+  EXPECT_NE(log.find(ignoring("/var/Tool.appex",
+                              "the \"PassProxy\" key is not supported on this platform")),
+            std::string::npos)
+      << log;
+}
+
+}  // namespace

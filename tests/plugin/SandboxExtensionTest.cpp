@@ -1,0 +1,182 @@
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <fstream>
+
+#include "platform/sandbox/BootKey.h"
+#include "platform/sandbox/GrantTable.h"
+#include "platform/sandbox/Sandbox.h"
+#include "tests/plugin/ChildProcess.h"
+#include "tests/plugin/DeviceRoot.h"
+
+namespace {
+
+using sandbox::GrantTable;
+using sandbox::Sandbox;
+
+class SandboxExtensionTest : public DeviceRootTest {
+ protected:
+  void SetUp() override {
+    DeviceRootTest::SetUp();
+    file_ = root_.write("file.txt", "contents");
+  }
+
+  std::string issue(const std::string& path) {
+    os::Result<std::string> token =
+        Sandbox::issueFileExtension(sandbox::kReadExtensionClass, path, true);
+    EXPECT_TRUE(token.ok()) << token.error().message;
+    return token.ok() ? token.value() : "";
+  }
+
+  // The path the grant of a freshly consumed |token| names, released again.
+  std::string grantedPath(const std::string& token) {
+    os::Result<std::int64_t> handle = Sandbox::consume(token);
+    if (!handle.ok()) return "error " + std::to_string(handle.error().errnum);
+    std::optional<sandbox::ExtensionToken> grant = GrantTable::shared().find(handle.value());
+    EXPECT_TRUE(Sandbox::release(handle.value()).ok());
+    return grant ? grant->path() : "no grant";
+  }
+
+  int consumeError(const std::string& token) {
+    os::Result<std::int64_t> handle = Sandbox::consume(token);
+    if (handle.ok()) Sandbox::release(handle.value());
+    return handle.ok() ? 0 : handle.error().errnum;
+  }
+
+  std::string file_;
+};
+
+TEST_F(SandboxExtensionTest, IssueConsumeReleaseRoundTrip) {
+  std::string token = issue(file_);
+  EXPECT_EQ(token.rfind(std::string("v1;") + sandbox::kReadExtensionClass + ";", 0), 0u) << token;
+
+  std::size_t held = GrantTable::shared().size();
+  os::Result<std::int64_t> handle = Sandbox::consume(token);
+  ASSERT_TRUE(handle.ok()) << handle.error().message;
+  EXPECT_GT(handle.value(), 0);
+  ASSERT_TRUE(GrantTable::shared().find(handle.value()));
+  EXPECT_EQ(GrantTable::shared().find(handle.value())->path(), canonical(file_));
+  EXPECT_EQ(GrantTable::shared().find(handle.value())->extensionClass(),
+            sandbox::kReadExtensionClass);
+  EXPECT_EQ(GrantTable::shared().size(), held + 1);
+
+  EXPECT_TRUE(Sandbox::release(handle.value()).ok());
+  EXPECT_EQ(GrantTable::shared().size(), held);
+  EXPECT_EQ(Sandbox::release(handle.value()).error().errnum, EBADF);
+  EXPECT_EQ(Sandbox::release(0).error().errnum, EBADF);
+}
+
+TEST_F(SandboxExtensionTest, ATokenNamesTheCanonicalPath) {
+  directory("dir/sub");
+  std::filesystem::create_symlink(file_, root_ / "link");
+  EXPECT_EQ(grantedPath(issue(root_ / "link")), canonical(file_));
+  EXPECT_EQ(grantedPath(issue(root_ / "dir/sub/../../file.txt")), canonical(file_));
+}
+
+TEST_F(SandboxExtensionTest, AnyByteOfThePathSurvives) {
+  std::string odd = root_.write("a;b\nc d", "x");
+  EXPECT_EQ(grantedPath(issue(odd)), canonical(odd));
+}
+
+TEST_F(SandboxExtensionTest, WithoutCanonicalisationThePathIsTakenAsGiven) {
+  std::filesystem::create_symlink(file_, root_ / "link");
+  os::Result<std::string> token =
+      Sandbox::issueFileExtension(sandbox::kReadExtensionClass, root_ / "link", false);
+  ASSERT_TRUE(token.ok());
+  EXPECT_EQ(grantedPath(token.value()), root_ / "link");
+
+  auto relative = Sandbox::issueFileExtension(sandbox::kReadExtensionClass, "file.txt", false);
+  EXPECT_EQ(relative.error().errnum, EINVAL);
+  auto missing = Sandbox::issueFileExtension(sandbox::kReadExtensionClass, root_ / "no", false);
+  EXPECT_EQ(missing.error().errnum, ENOENT);
+}
+
+TEST_F(SandboxExtensionTest, IssuingFailsWithTheErrorOfRealpath) {
+  auto missing = Sandbox::issueFileExtension(sandbox::kReadExtensionClass, root_ / "no", true);
+  ASSERT_FALSE(missing.ok());
+  EXPECT_EQ(missing.error().errnum, ENOENT);
+  auto throughFile =
+      Sandbox::issueFileExtension(sandbox::kReadExtensionClass, file_ + "/inside", true);
+  EXPECT_EQ(throughFile.error().errnum, ENOTDIR);
+  EXPECT_EQ(Sandbox::issueFileExtension(sandbox::kReadExtensionClass, "", true).error().errnum,
+            ENOENT);
+  EXPECT_EQ(Sandbox::issueFileExtension("", file_, true).error().errnum, EINVAL);
+  EXPECT_EQ(Sandbox::issueFileExtension("a;b", file_, true).error().errnum, EINVAL);
+}
+
+TEST_F(SandboxExtensionTest, AlteredTokensAreRefused) {
+  std::string token = issue(file_);
+  std::size_t pathStart = token.find(';', 3) + 1;
+  std::size_t macStart = token.rfind(';') + 1;
+
+  std::string otherPath = token;
+  otherPath[pathStart + 2] = otherPath[pathStart + 2] == '0' ? '1' : '0';
+  EXPECT_EQ(consumeError(otherPath), EPERM);
+
+  std::string otherMac = token;
+  otherMac[macStart] = otherMac[macStart] == '0' ? '1' : '0';
+  EXPECT_EQ(consumeError(otherMac), EPERM);
+
+  std::string otherClass = "v1;other.class" + token.substr(token.find(';', 3));
+  EXPECT_EQ(consumeError(otherClass), EPERM);
+
+  std::string forged = Sandbox::issueFileExtension(sandbox::kReadExtensionClass, file_, true)
+                           .value()
+                           .substr(0, macStart) +
+                       std::string(64, 'a');
+  EXPECT_EQ(consumeError(forged), EPERM);
+}
+
+TEST_F(SandboxExtensionTest, MalformedTokensAreInvalid) {
+  std::string token = issue(file_);
+  std::string upperCase = token;
+  for (std::size_t i = token.rfind(';') + 1; i < upperCase.size(); ++i) {
+    upperCase[i] = static_cast<char>(toupper(upperCase[i]));
+  }
+  for (const std::string& text :
+       {std::string(), std::string("v1"), "v2" + token.substr(2), token.substr(0, token.size() - 1),
+        token + ";", token.substr(0, token.rfind(';')), upperCase,
+        "v1;;" + token.substr(token.find(';', 3) + 1), std::string("v1;c;;") + std::string(64, '0'),
+        std::string("v1;c;00;") + std::string(64, '0')}) {
+    EXPECT_EQ(consumeError(text), EINVAL) << text;
+  }
+}
+
+TEST_F(SandboxExtensionTest, ATokenForAPathThatVanishedIsRefused) {
+  std::string token = issue(file_);
+  ASSERT_EQ(unlink(file_.c_str()), 0);
+  EXPECT_EQ(consumeError(token), ENOENT);
+}
+
+TEST_F(SandboxExtensionTest, ATokenOfAnotherRootIsRefused) {
+  std::string token = issue(file_);
+  TempDirectory otherRoot;
+  environment_.set("ANNEXA_ROOT", otherRoot.path());
+  EXPECT_EQ(consumeError(token), EPERM);
+}
+
+TEST_F(SandboxExtensionTest, ATokenOfAnotherProcessIsAccepted) {
+  std::string file = file_;
+  std::string token = outputsOfChildren(1, [&] {
+    auto issued = Sandbox::issueFileExtension(sandbox::kReadExtensionClass, file, true);
+    return issued.ok() ? issued.value() : std::string();
+  })[0];
+  ASSERT_FALSE(token.empty());
+  EXPECT_EQ(grantedPath(token), canonical(file_));
+}
+
+TEST_F(SandboxExtensionTest, TokensOfAnEarlierBootAreRefused) {
+  std::string token = issue(file_);
+  // The key file now claims another boot, as after a reboot: its key must not be used again.
+  std::ifstream in(sandbox::BootKey::path());
+  std::string bootId, keyHex;
+  std::getline(in, bootId);
+  std::getline(in, keyHex);
+  bootId[0] = bootId[0] == '0' ? '1' : '0';
+  std::ofstream(sandbox::BootKey::path(), std::ios::trunc) << bootId << "\n" << keyHex << "\n";
+  EXPECT_EQ(consumeError(token), EPERM);
+}
+
+}  // namespace
