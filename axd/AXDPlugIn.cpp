@@ -162,6 +162,19 @@ value::Dictionary AXDPlugIn::augmentForm(const value::Dictionary& form) const {
   return form.with("extensions", value::Value::dictionary(issueResourceExtensions(*shared)));
 }
 
+namespace {
+
+// A "Shared" entry such as "../.." would hand hosts the files around the bundle. Paths that do
+// not resolve are left to the issuing, which reports their own error.
+bool staysInsideBundle(const AXFileURL& target, const AXFileURL& bundle) {
+  os::Result<std::string> inside = os::Paths::canonical(target.path());
+  os::Result<std::string> root = os::Paths::canonical(bundle.path());
+  if (!inside.ok() || !root.ok()) return true;
+  return inside.value() == root.value() || inside.value().rfind(root.value() + "/", 0) == 0;
+}
+
+}  // namespace
+
 value::Dictionary AXDPlugIn::issueResourceExtensions(const value::Value& resources) const {
   value::Array list;
   if (resources.asString()) list.push_back(resources);
@@ -173,7 +186,9 @@ value::Dictionary AXDPlugIn::issueResourceExtensions(const value::Value& resourc
     const std::string* name = element.asString();
     if (!name) continue;
     AXFileURL target = *name == "." ? *bundle : AXFileURL(appendingPathComponent(*bundle, *name));
-    os::Result<std::string> token = AXSandboxIssueReadExtension(target);
+    os::Result<std::string> token = staysInsideBundle(target, *bundle)
+                                        ? AXSandboxIssueReadExtension(target)
+                                        : os::Result<std::string>(os::Error{EACCES, "outside"});
     if (token.ok()) {
       extensions[*name] = value::Value::string(token.value());
       continue;

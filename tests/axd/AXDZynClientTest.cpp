@@ -1,14 +1,14 @@
-// A client record made for a connection of this very process, so that the entitlement table can
-// name the test program.
+// A client's entitlements, read through the device root's real entitlement table.
 
 #include <gtest/gtest.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <asio/local/connect_pair.hpp>
+#include <filesystem>
 #include <fstream>
+#include <string>
 
-#include "axd/AXDPlugInSignature.h"
 #include "axd/AXDZynClient.h"
 #include "platform/os/Paths.h"
 #include "platform/os/Process.h"
@@ -17,62 +17,79 @@
 
 namespace {
 
-std::string selfPath() {
-  char path[4096];
-  ssize_t n = readlink("/proc/self/exe", path, sizeof path);
-  return std::string(path, n > 0 ? static_cast<std::size_t>(n) : 0);
+using value::Value;
+
+// This process as a client of the in-process server, over a socket pair. The listener keeps no
+// hold of the clients it makes, so the test makes its own the way the listener does.
+class SelfClient {
+ public:
+  SelfClient() {
+    int fds[2];
+    if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, fds) != 0) return;
+    peerEnd_ = fds[1];
+    asio::local::stream_protocol::socket socket(zyn::Runtime::shared().context());
+    socket.assign(asio::local::stream_protocol(), fds[0]);
+    auto pidfd = os::Process::openPidfd(getpid());
+    zyn::PeerCredentials peer{getpid(), getuid(), getgid(), pidfd.ok() ? pidfd.value() : -1};
+    auto connection = zyn::Connection::accepted(std::move(socket), peer, "self");
+    client_ = AXDZynClient::initWithConnection(connection, AXDServer::server());
+  }
+  // Closing our end ends the connection, and with it the client.
+  ~SelfClient() {
+    if (peerEnd_ >= 0) close(peerEnd_);
+  }
+  SelfClient(const SelfClient&) = delete;
+  SelfClient& operator=(const SelfClient&) = delete;
+
+  const std::shared_ptr<AXDZynClient>& client() const { return client_; }
+
+ private:
+  int peerEnd_ = -1;
+  std::shared_ptr<AXDZynClient> client_;
+};
+
+// A table file granting this test program the entitlements in |dictionary| (plist XML).
+void grantThisProgram(const std::string& dictionary) {
+  const std::string directory = InProcessServer::shared().root() + "/etc/annexa/entitlements.d";
+  std::filesystem::create_directories(directory);
+  const std::string file = directory + "/axd_tests.plist";
+  std::ofstream(file) << "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\">"
+                      << "<dict><key>Executable</key><string>"
+                      << os::Paths::canonical("/proc/self/exe").value()
+                      << "</string><key>Entitlements</key>" << dictionary << "</dict></plist>\n";
+  chmod(file.c_str(), 0644);
 }
 
-void writeEntitlementTable() {
-  std::string dir = InProcessServer::root() + "/etc/annexa/entitlements.d";
-  ASSERT_TRUE(os::Paths::ensureDirectory(dir, 0755).ok());
-  std::ofstream(dir + "/tests.plist") << R"(<?xml version="1.0" encoding="UTF-8"?>
-<plist version="1.0"><dict>
-<key>Executable</key><string>)" + selfPath() +
-                                             R"(</string>
-<key>Entitlements</key><dict>
-  <key>t.false</key><false/>
-  <key>t.zero</key><integer>0</integer>
-  <key>t.true</key><true/>
-  <key>t.one</key><integer>1</integer>
-  <key>t.string</key><string>yes</string>
-  <key>t.array</key><array/>
-</dict></dict></plist>
-)";
-}
+TEST(AXDZynClientTest, AnEntitlementCountsUnlessItIsAbsentFalseOrZero) {
+  ASSERT_TRUE(InProcessServer::shared().built());
+  grantThisProgram(
+      "<dict>"
+      "<key>test.false</key><false/>"
+      "<key>test.zero</key><integer>0</integer>"
+      "<key>test.zero.real</key><real>0.0</real>"
+      "<key>test.true</key><true/>"
+      "<key>test.one</key><integer>1</integer>"
+      "<key>test.half</key><real>0.5</real>"
+      "<key>test.string</key><string>yes</string>"
+      "<key>test.empty.string</key><string></string>"
+      "<key>test.array</key><array/>"
+      "<key>test.dictionary</key><dict/>"
+      "</dict>");
+  SelfClient self;
+  const auto& client = self.client();
+  ASSERT_TRUE(client);
+  ASSERT_TRUE(client->task()) << "no code-signing identity for this process";
 
-std::shared_ptr<AXDZynClient> clientOfThisProcess() {
-  asio::local::stream_protocol::socket ours(zyn::Runtime::shared().context());
-  asio::local::stream_protocol::socket theirs(zyn::Runtime::shared().context());
-  asio::local::connect_pair(ours, theirs);
-  zyn::PeerCredentials self{getpid(), getuid(), getgid(), os::Process::openPidfd(getpid()).value()};
-  auto connection = zyn::Connection::accepted(std::move(ours), self, "test.axd");
-  static std::vector<asio::local::stream_protocol::socket> keptOpen;
-  keptOpen.push_back(std::move(theirs));
-  return AXDZynClient::initWithConnection(connection, InProcessServer::server());
-}
-
-TEST(AXDZynClientTest, EntitlementsComeFromTheTableAndFalseLikeValuesDoNotCount) {
-  writeEntitlementTable();
-  auto client = clientOfThisProcess();
-  EXPECT_EQ(client->pid(), getpid());
-  EXPECT_EQ(client->entitlementValueForKey("t.string"), value::Value::string("yes"));
-  for (const char* key : {"t.false", "t.zero", "t.absent"}) {
+  for (const char* key : {"test.false", "test.zero", "test.zero.real", "test.absent"}) {
     EXPECT_FALSE(client->hasEntitlement(key)) << key;
   }
-  for (const char* key : {"t.true", "t.one", "t.string", "t.array"}) {
+  for (const char* key : {"test.true", "test.one", "test.half", "test.string", "test.empty.string",
+                          "test.array", "test.dictionary"}) {
     EXPECT_TRUE(client->hasEntitlement(key)) << key;
   }
-  EXPECT_FALSE(client->bundle() && client->bundle()->path()) << "the test program is no bundle";
-  EXPECT_NE(client->description().find("pid=" + std::to_string(getpid())), std::string::npos);
-}
-
-TEST(AXDPlugInSignatureTest, EverySignatureIsNew) {
-  AXDPlugInSignature first(AXFileURL("/Apps/Host.app/PlugIns/Tool.appex"));
-  AXDPlugInSignature second(AXFileURL("/Apps/Host.app/PlugIns/Tool.appex"));
-  EXPECT_NE(first.cdhash(), second.cdhash());
-  EXPECT_EQ(first.requirement(), "dummy requirement");
-  EXPECT_EQ(second.requirement(), "dummy requirement");
+  EXPECT_EQ(client->entitlementValueForKey("test.string"), Value::string("yes"));
+  EXPECT_EQ(client->entitlementValueForKey("test.false"), Value::boolean(false));
+  EXPECT_FALSE(client->entitlementValueForKey("test.absent"));
 }
 
 }  // namespace

@@ -3,74 +3,91 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <cstdint>
 #include <cstdlib>
 #include <fstream>
+#include <iostream>
 #include <sstream>
 #include <thread>
 
-#include "platform/os/Paths.h"
+#if defined(__SANITIZE_ADDRESS__)
+#include <sanitizer/common_interface_defs.h>
+#endif
 
 namespace {
 
-std::shared_ptr<AXDServer>& theServer() {
-  static auto* server = new std::shared_ptr<AXDServer>();
-  return *server;
-}
+InProcessServer* instance = nullptr;
 
-std::string& theRoot() {
-  static auto* root = new std::string();
-  return *root;
-}
+constexpr auto kPollInterval = std::chrono::milliseconds(10);
 
 }  // namespace
 
-void InProcessServer::setUp() {
-  char pattern[] = "/tmp/axd-inprocess-XXXXXX";
-  theRoot() = mkdtemp(pattern);
-  setenv("ANNEXA_ROOT", theRoot().c_str(), 1);
+InProcessServer::InProcessServer() {
+  instance = this;
+}
+
+InProcessServer& InProcessServer::shared() {
+  return *instance;
+}
+
+void InProcessServer::SetUp() {
+  ASSERT_FALSE(root_.path().empty());
+  // Both are read when first needed, so they must be in place before anything logs.
+  setenv("ANNEXA_ROOT", root_.path().c_str(), 1);
   setenv("AXD_LOG", "stderr", 1);
-  int log = open((theRoot() + "/axd.log").c_str(), O_WRONLY | O_CREAT | O_APPEND, 0644);
+  logPath_ = root_ / "axd.log";
+  int log = open(logPath_.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600);
+  ASSERT_GE(log, 0);
+  savedStderr_ = fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, 0);
   dup2(log, STDERR_FILENO);
   close(log);
-  theServer() = AXDServer::initForService("test.axd", nullptr);
-  theServer()->setVerbose(2);
-  theServer()->service()->resume();
+#if defined(__SANITIZE_ADDRESS__)
+  // A sanitizer's report must reach the terminal, not the captured log.
+  __sanitizer_set_report_fd(reinterpret_cast<void*>(static_cast<std::intptr_t>(savedStderr_)));
+#endif
+  built_ = AXDServer::initForService(kServiceName, nullptr);
+  ASSERT_TRUE(built_) << "initForService failed";
+  // What run() does before it parks the main thread for good.
+  built_->service()->resume();
 }
 
-const std::shared_ptr<AXDServer>& InProcessServer::server() {
-  return theServer();
+void InProcessServer::TearDown() {
+  if (savedStderr_ < 0) return;
+  dup2(savedStderr_, STDERR_FILENO);
+  if (!::testing::UnitTest::GetInstance()->Passed()) {
+    std::cerr << "---- the server's log ----\n" << logText() << "---- end of log ----\n";
+  }
 }
 
-const std::string& InProcessServer::root() {
-  return theRoot();
-}
-
-std::string InProcessServer::socketPath() {
-  return os::Paths::zynSocketDir() + "/test.axd";
-}
-
-std::string InProcessServer::log() {
-  std::ifstream file(theRoot() + "/axd.log");
+std::string InProcessServer::logText() const {
+  std::ifstream file(logPath_, std::ios::binary);
   std::stringstream text;
   text << file.rdbuf();
   return text.str();
 }
 
-std::size_t InProcessServer::occurrences(const std::string& text) {
-  std::string all = log();
-  std::size_t count = 0;
-  for (std::size_t at = 0; (at = all.find(text, at)) != std::string::npos; at += text.size()) {
-    ++count;
-  }
-  return count;
+std::size_t InProcessServer::logSize() const {
+  return logText().size();
 }
 
-bool InProcessServer::waitForLog(const std::string& text, std::size_t count,
-                                 std::chrono::milliseconds timeout) {
-  const auto deadline = std::chrono::steady_clock::now() + timeout;
-  while (occurrences(text) < count) {
-    if (std::chrono::steady_clock::now() >= deadline) return false;
-    std::this_thread::sleep_for(std::chrono::milliseconds(10));
+std::vector<std::string> InProcessServer::logLines(std::size_t since) const {
+  std::string text = logText();
+  std::istringstream lines(since < text.size() ? text.substr(since) : std::string());
+  std::vector<std::string> messages;
+  for (std::string line; std::getline(lines, line);) {
+    auto prefixEnd = line.find("]: ");
+    messages.push_back(prefixEnd == std::string::npos ? line : line.substr(prefixEnd + 3));
   }
-  return true;
+  return messages;
+}
+
+bool InProcessServer::waitForLog(std::string_view text, std::size_t since,
+                                 std::chrono::milliseconds timeout) const {
+  const auto deadline = std::chrono::steady_clock::now() + timeout;
+  for (;;) {
+    std::string log = logText();
+    if (since < log.size() && log.find(text, since) != std::string::npos) return true;
+    if (std::chrono::steady_clock::now() >= deadline) return false;
+    std::this_thread::sleep_for(kPollInterval);
+  }
 }

@@ -2,32 +2,54 @@
 
 #include <chrono>
 #include <cstdint>
+#include <memory>
 #include <optional>
+#include <span>
 #include <string>
-#include <vector>
 
+#include "platform/os/Error.h"
 #include "platform/value/Value.h"
 #include "platform/zyn/Frame.h"
 
-// A client that speaks bytes, not the client library: for malformed frames, one-way messages and
-// control frames. Blocking, with a timeout on every read.
+// A bare stream connection to a daemon's socket, for the bytes and frames that the client
+// library never sends. Every read waits at most the time it is given. Not thread-safe.
 class RawClient {
  public:
-  explicit RawClient(const std::string& socketPath);
+  // Long enough for a loaded machine under sanitizers; only a silent daemon reaches it.
+  static constexpr std::chrono::seconds kTimeout{30};
+
+  // Connects to the socket at |path|; fails with the system's error.
+  static os::Result<std::unique_ptr<RawClient>> connect(const std::string& path);
   ~RawClient();
   RawClient(const RawClient&) = delete;
   RawClient& operator=(const RawClient&) = delete;
 
-  bool connected() const { return fd_ >= 0; }
-  void sendBytes(const std::vector<std::uint8_t>& bytes);
-  void sendFrame(zyn::FrameKind kind, std::uint64_t id, const value::Value& body);
-  // The next frame from the daemon; nothing when the connection closed or |timeout| passed.
-  std::optional<zyn::Frame> receive(std::chrono::milliseconds timeout = std::chrono::seconds(10));
-  // True when the daemon closed the connection within |timeout|.
-  bool closedByPeer(std::chrono::milliseconds timeout = std::chrono::seconds(10));
-  void close();
+  // A bulk request with |flags| in protocol version 3, as the client library builds it.
+  static value::Value bulkRequest(std::uint64_t flags);
+
+  // Writes all of |bytes|; false when the socket refused them.
+  bool send(std::span<const std::uint8_t> bytes);
+  // Encodes the frame and writes it.
+  bool sendFrame(zyn::FrameKind kind, std::uint64_t id, const value::Value& body);
+
+  // The next frame from the daemon; nothing when none came within |timeout| or the stream
+  // ended, broke or held a bad frame.
+  std::optional<zyn::Frame> readFrame(std::chrono::milliseconds timeout = kTimeout);
+  // Sends |body| as request |id| and returns the body of the next frame when that is the reply
+  // to |id|; nothing otherwise.
+  std::optional<value::Value> request(std::uint64_t id, const value::Value& body);
+  // True when the daemon closed the connection within |timeout|. Frames that come first are
+  // read and dropped.
+  bool closedByPeer(std::chrono::milliseconds timeout = kTimeout);
 
  private:
-  int fd_ = -1;
+  explicit RawClient(int fd) : fd_(fd) {}
+
+  // Reads what the socket has within |timeout| into the decoder; false at the end of the
+  // stream, on an error or on timeout.
+  bool fill(std::chrono::milliseconds timeout);
+
+  int fd_;
+  bool ended_ = false;
   zyn::FrameDecoder decoder_;
 };

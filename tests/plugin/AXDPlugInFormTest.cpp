@@ -96,6 +96,19 @@ TEST_F(AXDPlugInFormTest, AResourceThatCannotBeSharedIsLeftOutAndLogged) {
       << log.text();
 }
 
+TEST_F(AXDPlugInFormTest, AResourceOutsideTheBundleIsNeverShared) {
+  auto record = inApp("Tool.bundle", A({S("../Tool.appex"), S("Resources/../Resources")}));
+  ASSERT_TRUE(record);
+  LogCapture log;
+  value::Dictionary extensions = extensionsOf(record->augmentForm({}));
+  EXPECT_EQ(extensions.size(), 1u);
+  EXPECT_TRUE(extensions.find("Resources/../Resources"));
+  EXPECT_NE(
+      log.text().find("/../Tool.appex in plug-in at " + record->path() + ": Permission denied"),
+      std::string::npos)
+      << log.text();
+}
+
 class AXDPlugInEntitlementTest : public ::testing::Test {
  protected:
   static std::shared_ptr<AXDPlugIn> withEntitlements(value::Dictionary entitlements) {
