@@ -27,7 +27,7 @@ void AXDZynClient::setUp(const std::shared_ptr<zyn::Connection>& connection) {
   if (path.size() >= kExecutablePathBuffer) path.clear();
   if (!path.empty()) bundle_ = AXBundle::initWithExecutableURL(AXFileURL(path));
   server_->debug("client %d %s", {pid(), path});
-  AXD_PROBE_CLIENT_NEW(pid());
+  os::Probes::clientNew(pid());
   _task = codesign::Task::fromAuditToken(connection->peerPid(), connection->auditToken());
   auto self = shared_from_this();
   connection->setContext(self);
@@ -59,9 +59,9 @@ void AXDZynClient::handleMessage(const zyn::Message& message) {
     return;
   }
   if (server_->verbose() >= 2) server_->debug("incoming request %@", {message.body.description()});
-  if (AXD_PROBE_REQUEST_INPUT_ENABLED()) {
+  if (os::Probes::requestInputEnabled()) {
     std::string text = message.body.description();
-    AXD_PROBE_REQUEST_INPUT(pid(), text.c_str());
+    os::Probes::requestInput(pid(), text.c_str());
   }
   auto transaction = std::make_shared<Transaction>(message, shared_from_this());
   auto self = shared_from_this();
@@ -103,7 +103,7 @@ void AXDZynClient::dying() {
 void AXDZynClient::dead() {
   server_->debug("client %d is dead", {pid()});
   acceptWork_.store(false);
-  AXD_PROBE_CLIENT_DONE(pid());
+  os::Probes::clientDone(pid());
 }
 
 std::string AXDZynClient::description() const {

@@ -47,7 +47,7 @@ void Transaction::dispatch() {
   pid_t pid = client_->pid();
   const char* typeText = type ? type->c_str() : nullptr;
   server()->debug("client %d request %s", {pid, typeText});
-  AXD_PROBE_REQUEST(pid, typeText);
+  os::Probes::request(pid, typeText);
   if (!type) {
     fail(AXProtocol::kMalformedRequest, "invalid request format (missing type)");
     return;
@@ -63,9 +63,9 @@ void Transaction::dispatch() {
 
 void Transaction::done() {
   if (server()->verbose() >= 2) server()->debug("Replying %@", {reply_.body().description()});
-  if (AXD_PROBE_REQUEST_OUTPUT_ENABLED()) {
+  if (os::Probes::requestOutputEnabled()) {
     std::string text = reply_.body().description();
-    AXD_PROBE_REQUEST_OUTPUT(client_->pid(), text.c_str());
+    os::Probes::requestOutput(client_->pid(), text.c_str());
   }
   if (auto connection = this->connection()) connection->send(reply_);
 }
