@@ -92,4 +92,17 @@ TEST(AXDZynClientTest, AnEntitlementCountsUnlessItIsAbsentFalseOrZero) {
   EXPECT_FALSE(client->entitlementValueForKey("test.absent"));
 }
 
+TEST(AXDZynClientTest, AClientKnowsItsPeer) {
+  ASSERT_TRUE(InProcessServer::shared().built());
+  SelfClient self;
+  const auto& client = self.client();
+  ASSERT_TRUE(client);
+  EXPECT_EQ(client->pid(), getpid());
+  EXPECT_TRUE(client->acceptWork());
+  EXPECT_FALSE(client->bundle() && client->bundle()->path()) << "the test program is no bundle";
+  EXPECT_NE(client->description().find(" pid=" + std::to_string(getpid()) + " con="),
+            std::string::npos)
+      << client->description();
+}
+
 }  // namespace

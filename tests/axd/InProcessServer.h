@@ -28,7 +28,7 @@ class InProcessServer : public ::testing::Environment {
   static InProcessServer& shared();
 
   void SetUp() override;
-  // Gives standard error back, with the captured log when a test failed.
+  // Shows the captured log on the original standard error when a test failed.
   void TearDown() override;
 
   // What initForService() returned; null when it failed (recorded as a failure).

@@ -10,8 +10,9 @@ bool DaemonTest::start(const std::vector<std::string>& arguments, const std::str
   // The old daemon puts ANNEXA_ROOT back when it goes, so it must go before the new one sets it.
   daemon_.reset();
   serviceName_ = serviceName;
-  DaemonProcess::Options options{arguments, serviceName, true};
-  auto started = DaemonProcess::start(AXD_BINARY, options);
+  DaemonProcess::Options options{
+      .arguments = arguments, .serviceName = serviceName, .captureLog = true};
+  auto started = DaemonProcess::start(AXD_EXECUTABLE, options);
   if (!started.ok()) {
     ADD_FAILURE() << "axd did not start: " << started.error().message;
     return false;
@@ -36,7 +37,7 @@ std::unique_ptr<RawClient> DaemonTest::connectRaw() {
 }
 
 Subprocess::Outcome DaemonTest::axctl(const std::vector<std::string>& arguments) {
-  return Subprocess::run(AXCTL_BINARY, arguments, {{"ANNEXA_ROOT", daemon_->root()}});
+  return Subprocess::run(AXCTL_EXECUTABLE, arguments, {{"ANNEXA_ROOT", daemon_->root()}});
 }
 
 std::string DaemonTest::thisClient() {

@@ -13,8 +13,8 @@
 #include "tests/e2e/Subprocess.h"
 #include "tests/support/DaemonProcess.h"
 
-// A test that runs the real axd (AXD_BINARY) on a fresh device root with its log captured, and
-// talks to it with the client library, raw sockets and axctl (AXCTL_BINARY). The root is this
+// A test that runs the real axd (AXD_EXECUTABLE) on a fresh device root with its log captured, and
+// talks to it with the client library, raw sockets and axctl (AXCTL_EXECUTABLE). The root is this
 // process's ANNEXA_ROOT while the daemon runs.
 class DaemonTest : public ::testing::Test {
  protected:

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "Annexa/AXProtocol.h"
+#include "tests/support/BlockingClient.h"
 
 using value::Value;
 
@@ -74,11 +75,11 @@ std::optional<zyn::Frame> RawClient::readFrame(std::chrono::milliseconds timeout
   }
 }
 
-std::optional<Value> RawClient::request(std::uint64_t id, const Value& body) {
-  if (!sendFrame(zyn::FrameKind::Request, id, body)) return std::nullopt;
+std::string RawClient::request(std::uint64_t id, const Value& body) {
+  if (!sendFrame(zyn::FrameKind::Request, id, body)) return "cannot send";
   std::optional<zyn::Frame> reply = readFrame();
-  if (!reply || reply->kind != zyn::FrameKind::Reply || reply->id != id) return std::nullopt;
-  return reply->body;
+  if (!reply || reply->kind != zyn::FrameKind::Reply || reply->id != id) return "no reply";
+  return BlockingClient::describe(zyn::ReplyOrError(reply->body));
 }
 
 bool RawClient::closedByPeer(std::chrono::milliseconds timeout) {
@@ -97,6 +98,7 @@ bool RawClient::fill(std::chrono::milliseconds timeout) {
   if (ended_) return false;
   pollfd readable{fd_, POLLIN, 0};
   int ready = poll(&readable, 1, static_cast<int>(timeout.count()));
+  if (ready < 0 && errno == EINTR) return true;
   if (ready <= 0) return false;
   std::uint8_t* space = decoder_.prepare(kReadChunk);
   ssize_t n = recv(fd_, space, kReadChunk, 0);

@@ -35,9 +35,9 @@ class RawClient {
   // The next frame from the daemon; nothing when none came within |timeout| or the stream
   // ended, broke or held a bad frame.
   std::optional<zyn::Frame> readFrame(std::chrono::milliseconds timeout = kTimeout);
-  // Sends |body| as request |id| and returns the body of the next frame when that is the reply
-  // to |id|; nothing otherwise.
-  std::optional<value::Value> request(std::uint64_t id, const value::Value& body);
+  // Sends |body| as request |id| and describes the next frame as BlockingClient::describe()
+  // does when it is the reply to |id|; "no reply" when it is another frame or none came.
+  std::string request(std::uint64_t id, const value::Value& body);
   // True when the daemon closed the connection within |timeout|. Frames that come first are
   // read and dropped.
   bool closedByPeer(std::chrono::milliseconds timeout = kTimeout);

@@ -32,7 +32,9 @@ TEST_F(DaemonTest, OnlyProtocolVersionsTwoAndThreeAreServed) {
             "7: unsupported protocol version 0 (current 3)");
   EXPECT_EQ(client.outcome(envelope("bulk", 1)), "7: unsupported protocol version 1 (current 3)");
   EXPECT_EQ(client.outcome(envelope("bulk", 4)), "7: unsupported protocol version 4 (current 3)");
-  // The version is read as an unsigned integer: text is no version at all.
+  // The version is read as an unsigned integer: a signed integer or text is no version at all.
+  EXPECT_EQ(client.outcome(envelope(Value::string("bulk"), Value::integer(3))),
+            "7: unsupported protocol version 0 (current 3)");
   EXPECT_EQ(client.outcome(envelope(Value::string("bulk"), Value::string("3"))),
             "7: unsupported protocol version 0 (current 3)");
   // All 64 bits count: a version whose low 32 bits read 3 is not version 3.
@@ -58,7 +60,7 @@ TEST_F(DaemonTest, TheRequestTypeMustBeAStringNamingAServedRequest) {
             "4: invalid request format (missing type)");
   EXPECT_EQ(client.outcome(envelope(Value::unsignedInteger(3), version)),
             "4: invalid request format (missing type)");
-  for (const char* type : {"BULK", "bulk ", "", "frobnicate", "match"}) {
+  for (const char* type : {"BULK", "Bulk", "bulk ", "", "frobnicate", "match"}) {
     EXPECT_EQ(client.outcome(envelope(type, 3)), "4: unrecognized request") << type;
   }
 }
