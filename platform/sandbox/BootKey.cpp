@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <optional>
 
+#include "platform/os/AtomicFile.h"
 #include "platform/os/Paths.h"
 #include "platform/sandbox/FileReading.h"
 #include "platform/sandbox/Hex.h"
@@ -73,16 +74,6 @@ os::Result<std::optional<std::string>> readKey(const std::string& bootId) {
   return parse(text.value(), bootId);
 }
 
-os::Status writeAll(int fd, const std::string& bytes) {
-  for (std::size_t written = 0; written < bytes.size();) {
-    ssize_t n = write(fd, bytes.data() + written, bytes.size() - written);
-    if (n < 0 && errno == EINTR) continue;
-    if (n < 0) return os::Error::fromErrno("write");
-    written += static_cast<std::size_t>(n);
-  }
-  return os::success();
-}
-
 os::Result<std::string> randomKey() {
   std::string key(kKeySize, '\0');
   for (std::size_t filled = 0; filled < kKeySize;) {
@@ -101,14 +92,10 @@ os::Result<std::string> replaceKey(const std::string& bootId) {
   os::Result<std::string> key = randomKey();
   if (!key.ok()) return key;
   std::string text = bootId + "\n" + Hex::encode(key.value()) + "\n";
-  std::string temporary = directory() + "/key.XXXXXX";
-  FileDescriptor fd(mkostemp(temporary.data(), O_CLOEXEC));  // mode 0600
-  if (fd.get() < 0) return os::Error::fromErrno("mkostemp " + temporary);
-  os::Status written = writeAll(fd.get(), text);
-  if (written.ok() && rename(temporary.c_str(), BootKey::path().c_str()) == 0) return key;
-  os::Error failed = written.ok() ? os::Error::fromErrno("rename " + temporary) : written.error();
-  unlink(temporary.c_str());
-  return failed;
+  os::Status written =
+      os::AtomicFile::replace(BootKey::path(), text, os::AtomicFile::Durability::Volatile);
+  if (!written.ok()) return written.error();
+  return key;
 }
 
 // The slow path: under the creation lock, read again (another process may have just made the

@@ -1,5 +1,9 @@
 #include <gtest/gtest.h>
 
+#include <optional>
+#include <tuple>
+#include <vector>
+
 #include "platform/sdk/SdkMerge.h"
 
 namespace {
@@ -38,15 +42,20 @@ TEST(SdkMergeTest, MergeExampleGivesStatedResult) {
   EXPECT_EQ(sdk::mergeDictionary(sdkSide, manifestSide), expected);
 }
 
-TEST(SdkMergeTest, KeysOfOneSideAreKeptWhole) {
+TEST(SdkMergeTest, KeysOfOneSideAreKeptWholeAndTheManifestWinsTheRest) {
   Dictionary nested{{"deep", dict({{"k", num(1)}})}, {"Shared", str("only-sdk")}};
-  Dictionary sdkSide{{"Extra", dict(nested)}, {"Both", num(1)}};
-  Dictionary manifestSide{{"Both", num(2)}, {"Mine", str("m")}};
-  Dictionary merged = sdk::mergeDictionary(sdkSide, manifestSide);
-  EXPECT_EQ(*merged.find("Extra"), dict(nested));  // copied whole, "Shared" string untouched
-  EXPECT_EQ(*merged.find("Both"), num(2));
-  EXPECT_EQ(*merged.find("Mine"), str("m"));
-  EXPECT_EQ(merged.size(), 3u);
+  Dictionary sdkSide{{"Extra", dict(nested)},
+                     {"Both", num(1)},
+                     {"cleantimeout", num(1)},
+                     {"Flat", dict({{"a", num(1)}})}};
+  Dictionary manifestSide{
+      {"Both", num(2)}, {"Mine", str("m")}, {"cleantimeout", num(2)}, {"Flat", str("flat")}};
+  Dictionary expected{{"Extra", dict(nested)},  // copied whole, "Shared" string untouched
+                      {"Both", num(2)},
+                      {"Mine", str("m")},
+                      {"cleantimeout", num(2)},  // the override is case-sensitive
+                      {"Flat", str("flat")}};
+  EXPECT_EQ(sdk::mergeDictionary(sdkSide, manifestSide), expected);
 }
 
 TEST(SdkMergeTest, RulesApplyAtEveryDepthAndNeverChangeInputs) {
@@ -60,61 +69,45 @@ TEST(SdkMergeTest, RulesApplyAtEveryDepthAndNeverChangeInputs) {
   EXPECT_EQ(manifestSide, manifestCopy);
 }
 
-TEST(SdkMergeTest, ManifestNonDictionaryBeatsSdkDictionary) {
-  Dictionary merged = sdk::mergeDictionary({{"K", dict({{"a", num(1)}})}}, {{"K", str("flat")}});
-  EXPECT_EQ(*merged.find("K"), str("flat"));
+// A union without repeats, the SDK's first; single strings count as lists, other values as none.
+TEST(SdkMergeTest, SharedResourcesAreAUnionInSdkOrder) {
+  const std::vector<std::tuple<Value, Value, Value>> cases = {
+      {list({str("a"), str("b"), str("a")}), list({str("c"), str("b"), num(3)}),
+       list({str("a"), str("b"), str("c"), num(3)})},
+      {str("x"), str("y"), list({str("x"), str("y")})},
+      {str("x"), str("x"), list({str("x")})},
+      {num(7), list({str("y")}), list({str("y")})},
+      {Value(), dict({}), list({})},
+  };
+  for (const auto& [sdkSide, manifestSide, expected] : cases) {
+    SCOPED_TRACE(sdkSide.description() + " + " + manifestSide.description());
+    EXPECT_EQ(sdk::mergeSharedResources(sdkSide, manifestSide), expected);
+    Dictionary merged = sdk::mergeDictionary({{"Shared", sdkSide}}, {{"Shared", manifestSide}});
+    EXPECT_EQ(*merged.find("Shared"), expected);
+  }
 }
 
-TEST(SdkMergeTest, OnlyCleanTimeoutIsOverridden) {
-  EXPECT_TRUE(sdk::sdkOverridesKey("CleanTimeout"));
-  EXPECT_FALSE(sdk::sdkOverridesKey("cleantimeout"));
-  EXPECT_FALSE(sdk::sdkOverridesKey("Shared"));
-  EXPECT_FALSE(sdk::sdkOverridesKey(""));
-}
-
-TEST(SdkMergeTest, SharedResourcesUnionKeepsSdkOrderFirst) {
-  Value merged = sdk::mergeSharedResources(list({str("a"), str("b"), str("a")}),
-                                           list({str("c"), str("b"), num(3)}));
-  EXPECT_EQ(merged, list({str("a"), str("b"), str("c"), num(3)}));
-}
-
-TEST(SdkMergeTest, SharedResourcesAcceptSingleStringsAndIgnoreOtherValues) {
-  EXPECT_EQ(sdk::mergeSharedResources(str("x"), str("y")), list({str("x"), str("y")}));
-  EXPECT_EQ(sdk::mergeSharedResources(str("x"), str("x")), list({str("x")}));
-  EXPECT_EQ(sdk::mergeSharedResources(num(7), list({str("y")})), list({str("y")}));
-  EXPECT_EQ(sdk::mergeSharedResources(Value(), dict({})), list({}));
-  Dictionary merged = sdk::mergeDictionary({{"Shared", str("x")}}, {{"Shared", str("y")}});
-  EXPECT_EQ(*merged.find("Shared"), list({str("x"), str("y")}));
-}
-
-Dictionary plugInInfo(Dictionary plugIn, std::optional<Value> bundleVersion) {
-  Dictionary info{{"QSExtension", dict(std::move(plugIn))}};
-  if (bundleVersion) info = info.with("QFBundleShortVersionString", *bundleVersion);
-  return info;
-}
-
-Value versionOf(const Dictionary& info) {
-  const Value* attributes = info.find("QSExtension")->asDictionary()->find("QSExtensionAttributes");
-  const Value* version = attributes->asDictionary()->find("QSExtensionVersion");
-  return version ? *version : Value();
-}
-
-TEST(SdkMergeTest, CanonicalizeFillsTheVersion) {
-  Dictionary withAttributes{{"QSExtensionAttributes", dict({{"k", num(1)}})}};
-  EXPECT_EQ(versionOf(sdk::canonicalize(plugInInfo(withAttributes, str("2.1")))), str("2.1"));
-  EXPECT_EQ(versionOf(sdk::canonicalize(plugInInfo(withAttributes, std::nullopt))), str("1"));
-  EXPECT_EQ(versionOf(sdk::canonicalize(plugInInfo(withAttributes, num(2)))), str("1"));
-  Dictionary ownVersion{{"QSExtensionAttributes", dict({{"QSExtensionVersion", str("3")}})}};
-  EXPECT_EQ(versionOf(sdk::canonicalize(plugInInfo(ownVersion, str("2.1")))), str("3"));
-}
-
-TEST(SdkMergeTest, CanonicalizeMakesMissingOrMistypedAttributesEmpty) {
-  for (const Dictionary& plugIn :
-       {Dictionary{}, Dictionary{{"QSExtensionAttributes", str("not a dictionary")}}}) {
-    Dictionary info = sdk::canonicalize(plugInInfo(plugIn, std::nullopt));
-    const Value* attributes =
-        info.find("QSExtension")->asDictionary()->find("QSExtensionAttributes");
-    EXPECT_EQ(*attributes, dict({{"QSExtensionVersion", str("1")}}));
+// The version comes from the attributes, else the bundle's version string, else "1".
+TEST(SdkMergeTest, CanonicalizeFillsTheVersionAndTheAttributes) {
+  const Value attributes = dict({{"k", num(1)}});
+  const std::vector<std::tuple<Value, std::optional<Value>, Value>> cases = {
+      {attributes, str("2.1"), dict({{"k", num(1)}, {"QSExtensionVersion", str("2.1")}})},
+      {attributes, std::nullopt, dict({{"k", num(1)}, {"QSExtensionVersion", str("1")}})},
+      {attributes, num(2), dict({{"k", num(1)}, {"QSExtensionVersion", str("1")}})},
+      {dict({{"QSExtensionVersion", str("3")}}), str("2.1"),
+       dict({{"QSExtensionVersion", str("3")}})},
+      {Value(), std::nullopt, dict({{"QSExtensionVersion", str("1")}})},
+      {str("not a dictionary"), std::nullopt, dict({{"QSExtensionVersion", str("1")}})},
+  };
+  for (const auto& [given, bundleVersion, expected] : cases) {
+    SCOPED_TRACE(given.description());
+    Dictionary plugIn{{"Other", num(4)}};
+    if (!given.isNull()) plugIn = plugIn.with("QSExtensionAttributes", given);
+    Dictionary info{{"QSExtension", dict(plugIn)}};
+    if (bundleVersion) info = info.with("QFBundleShortVersionString", *bundleVersion);
+    Dictionary canonical = sdk::canonicalize(info);
+    EXPECT_EQ(*canonical.find("QSExtension"), dict(plugIn.with("QSExtensionAttributes", expected)));
+    EXPECT_EQ(canonical.without("QSExtension"), info.without("QSExtension"));
   }
 }
 

@@ -304,7 +304,10 @@ TEST_F(WorkspaceTest, UninstallRemovesTheApplicationWithItsPlugIns) {
 }
 
 TEST_F(WorkspaceTest, QueryPreselectsPlainStringsAndHonoursTheFilter) {
-  registerAt(root_.plugIn("A.appex", "a", "point.one"));
+  root_.plugIn("A.appex", "a", "point.one");
+  root_.writePlist("A.appex/Entitlements.plist",
+                   Value::dictionary({{"grant", Value::string("yes")}}));
+  registerAt(root_ / "A.appex");
   registerAt(root_.plugIn("B.appex", "b", "point.two"));
   root_.writePlist("NoPoint.appex/Info.plist",
                    Value::dictionary({{"QFBundleIdentifier", Value::string("c")},
@@ -335,28 +338,14 @@ TEST_F(WorkspaceTest, QueryPreselectsPlainStringsAndHonoursTheFilter) {
 
   std::vector<std::string> seen;
   auto filter = [&](const std::string& identifier, const Dictionary& entitlements) {
-    seen.push_back(identifier);
-    EXPECT_TRUE(entitlements.empty());
-    return identifier != "a";
+    seen.push_back(identifier + (entitlements.find("grant") ? "+" : ""));
+    return identifier != "b";
   };
-  EXPECT_EQ(identifiers({}, filter), "dbc");
-  EXPECT_EQ(seen, (std::vector<std::string>{"a", "d", "b", "c"}));
+  EXPECT_EQ(identifiers({}, filter), "adc");
+  EXPECT_EQ(seen, (std::vector<std::string>{"a+", "d", "b", "c"}));
 }
 
-TEST_F(WorkspaceTest, FilterSeesEntitlements) {
-  root_.plugIn("E.appex", "e");
-  root_.writePlist("E.appex/Entitlements.plist",
-                   Value::dictionary({{"grant", Value::string("yes")}}));
-  registerAt(root_ / "E.appex");
-  registerAt(root_.plugIn("F.appex", "f"));
-  auto kept = workspace_->query({}, [](const std::string&, const Dictionary& entitlements) {
-    return entitlements.find("grant") != nullptr;
-  });
-  ASSERT_EQ(kept.value().size(), 1u);
-  EXPECT_EQ(kept.value()[0]->plugInIdentifier(), "e");
-}
-
-TEST_F(WorkspaceTest, ReopeningKeepsRecordsAndUnknownSchemaIsRefused) {
+TEST_F(WorkspaceTest, ReopeningKeepsRecordsAndAnUnknownSchemaOrAFileIsRefused) {
   auto record = registerAt(root_.plugIn("P.appex", "p"));
   workspace_->clearCaches();
   auto reopened = Workspace::open(root_.root());
@@ -374,6 +363,10 @@ TEST_F(WorkspaceTest, ReopeningKeepsRecordsAndUnknownSchemaIsRefused) {
   ASSERT_FALSE(refused.ok());
   EXPECT_EQ(refused.error().errnum, EIO);
   EXPECT_NE(refused.error().message.find("99"), std::string::npos);
+
+  auto notADirectory = Workspace::open(root_.writeFile("file", "x"));
+  ASSERT_FALSE(notADirectory.ok());
+  EXPECT_EQ(notADirectory.error().errnum, ENOTDIR);
 }
 
 TEST_F(WorkspaceTest, DefaultWorkspaceIsSharedPerRoot) {
@@ -388,14 +381,6 @@ TEST_F(WorkspaceTest, DefaultWorkspaceIsSharedPerRoot) {
   auto third = Workspace::defaultWorkspace();
   ASSERT_TRUE(third.ok());
   EXPECT_NE(third.value(), first.value());
-}
-
-TEST_F(WorkspaceTest, UnusableRootFails) {
-  RegistryFixture other;
-  std::string file = other.writeFile("file", "x");
-  auto opened = Workspace::open(file);
-  ASSERT_FALSE(opened.ok());
-  EXPECT_EQ(opened.error().errnum, ENOTDIR);
 }
 
 }  // namespace

@@ -1,0 +1,125 @@
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <filesystem>
+
+#include "ScopedEnvironment.h"
+#include "TempDirectory.h"
+#include "platform/consent/ConsentStore.h"
+#include "platform/prefs/Preferences.h"
+#include "tests/annexa/LogCapture.h"
+
+namespace {
+
+using prefs::Preferences;
+using value::Value;
+
+std::string plist(const std::string& body) {
+  return "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\">" + body +
+         "</plist>\n";
+}
+
+class PreferencesTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    environment_.set("ANNEXA_ROOT", root_.path());
+    std::filesystem::create_directories(root_ / directory_);
+  }
+
+  // Writes the domain "d" as another program would: in place, or renamed over the old file.
+  void writeDomain(const std::string& body, bool inPlace) const {
+    if (inPlace) {
+      root_.write(directory_ + "/d.plist", plist(body));
+      return;
+    }
+    root_.write(directory_ + "/new", plist(body));
+    ASSERT_EQ(std::rename((root_ / directory_ + "/new").c_str(),
+                          (root_ / directory_ + "/d.plist").c_str()),
+              0);
+  }
+
+  static std::optional<Value> k() { return Preferences::copyValue("k", "d"); }
+
+  TempDirectory root_;
+  ScopedEnvironment environment_;
+  const std::string directory_ = "var/users/" + std::to_string(geteuid()) + "/Preferences";
+};
+
+TEST_F(PreferencesTest, ChangesByAnotherProgramAreSeenAtTheNextSynchronize) {
+  ASSERT_TRUE(Preferences::setValue("k", Value::integer(1), "d").ok());
+  EXPECT_EQ(k(), Value::integer(1));
+  writeDomain("<dict><key>k</key><integer>2</integer></dict>", false);
+  EXPECT_EQ(k(), Value::integer(1));  // Not synchronized yet.
+  ASSERT_TRUE(Preferences::synchronize("d").ok());
+  EXPECT_EQ(k(), Value::integer(2));
+  // Same size, same inode, within the file system's clock tick.
+  writeDomain("<dict><key>k</key><integer>3</integer></dict>", true);
+  ASSERT_TRUE(Preferences::synchronize("d").ok());
+  EXPECT_EQ(k(), Value::integer(3));
+  std::filesystem::remove(root_ / directory_ + "/d.plist");
+  ASSERT_TRUE(Preferences::synchronize("d").ok());
+  EXPECT_EQ(k(), std::nullopt);
+}
+
+TEST_F(PreferencesTest, BrokenFilesReadAsNothingAndAreLoggedOncePerChange) {
+  for (const std::string& body : {std::string("<dict><key>k</key>"), std::string("<array/>")}) {
+    writeDomain(body, true);
+    LogCapture log;
+    ASSERT_TRUE(Preferences::synchronize("d").ok());
+    ASSERT_TRUE(Preferences::synchronize("d").ok());
+    EXPECT_EQ(k(), std::nullopt) << body;
+    std::string text = log.text();
+    EXPECT_NE(text.find("d.plist"), std::string::npos) << body;
+    EXPECT_EQ(text.find("d.plist"), text.rfind("d.plist")) << text;
+    // A writer refuses to replace what it cannot read, and leaves it as it is.
+    EXPECT_EQ(Preferences::setValue("k", Value::integer(1), "d").error().errnum, EINVAL);
+  }
+  EXPECT_EQ(Preferences::setValue("k", Value(), "e").error().errnum, EINVAL);  // Null.
+  writeDomain("<dict><key>k</key><true/><key>j</key><true/></dict>", false);
+  ASSERT_TRUE(Preferences::setValue("j", std::nullopt, "d").ok());
+  EXPECT_EQ(k(), Value::boolean(true));
+  EXPECT_EQ(Preferences::copyValue("j", "d"), std::nullopt);
+}
+
+TEST_F(PreferencesTest, InvalidDomainNamesAreRefused) {
+  for (const std::string& domain :
+       std::vector<std::string>{"", ".", "..", "a/b", "/x", std::string("a\0b", 3)}) {
+    EXPECT_EQ(Preferences::synchronize(domain).error().errnum, EINVAL) << domain;
+    EXPECT_EQ(Preferences::setValue("k", Value::integer(1), domain).error().errnum, EINVAL);
+    EXPECT_EQ(Preferences::copyValue("k", domain), std::nullopt) << domain;
+  }
+  EXPECT_TRUE(Preferences::setValue("k", Value::integer(1), "..a").ok());
+  EXPECT_TRUE(std::filesystem::exists(root_ / directory_ + "/..a.plist"));
+}
+
+TEST_F(PreferencesTest, ConsentEntriesOfABundle) {
+  using Entries = std::vector<std::pair<std::string, std::optional<bool>>>;
+  auto entries = [](const std::string& bundle) -> std::optional<Entries> {
+    auto found = consent::ConsentStore::informationForBundle(bundle);
+    if (!found) return std::nullopt;
+    Entries pairs;
+    for (const auto& entry : *found) pairs.emplace_back(entry.service, entry.granted);
+    return pairs;
+  };
+  EXPECT_EQ(entries("a"), Entries());  // No file: nothing granted.
+  std::filesystem::create_directories(root_ / "var/db");
+  root_.write("var/db/consent.plist",
+              plist("<dict><key>a</key><array><dict><key>Service</key><string>s1</string>"
+                    "<key>Granted</key><true/></dict><string>x</string><dict><key>Granted</key>"
+                    "<true/></dict><dict><key>Service</key><integer>5</integer></dict>"
+                    "<dict><key>Service</key><string>s2</string><key>Granted</key>"
+                    "<string>yes</string></dict><dict><key>Service</key><string>s3</string>"
+                    "<key>Granted</key><false/></dict></array><key>b</key><string>x</string>"
+                    "</dict>"));
+  EXPECT_EQ(entries("a"), (Entries{{"s1", true}, {"s2", std::nullopt}, {"s3", false}}));
+  EXPECT_EQ(entries("b"), std::nullopt);  // Not an array.
+  EXPECT_EQ(entries("c"), Entries());
+  for (const std::string& broken : {std::string("<dict>"), plist("<array/>")}) {
+    root_.write("var/db/consent.plist", broken);
+    EXPECT_EQ(entries("a"), std::nullopt) << broken;
+  }
+}
+
+}  // namespace
