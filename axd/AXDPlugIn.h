@@ -84,6 +84,29 @@ class AXDPlugIn : public AXPlugInCore {
   // initWithRGData).
   std::string annotationKey() const;
 
+  // ---- Matching rules (AXDPlugInMatching.cpp) -------------------------------------------------
+
+  // True when the plug-in satisfies every entry of |rule|, tried in key order and stopping at
+  // the first that fails; an absent or empty rule is satisfied by every plug-in.
+  bool match(const std::optional<value::Dictionary>& rule) const;
+  // One entry: the plug-in value named by |key| against |pattern|. Keys: "ENTITLEMENT:<name>",
+  // "QSExtensionIdentifier", "<vendor prefix>.uuid", "QSUserElection" (the election with bits 8
+  // to 15 cleared, in decimal; 0 without one), "QSExtensionContainingApp" (never matches
+  // without a containing application), else the attribute of that name, else the manifest key.
+  // Patterns: true (present and not the boolean false), false (absent or the boolean false), a
+  // dictionary (matchDictionary), a string or an array of strings (matchValuePatterns against a
+  // string value, or against any string element of an array value). Anything else: false.
+  bool matchKey(const std::string& key, const value::Value& pattern) const;
+  // |value| against a string pattern or any string of an array pattern; false for other kinds.
+  bool matchValuePatterns(const std::string& value, const value::Value& patterns) const;
+  // |value| against one string pattern by its operator: "?UT-CONFORMS:", "?UT-IS:" (type
+  // conformance), any other "?" (never; logged as "unrecognized match operator:<pattern>"),
+  // "<>", "<=", ">=", "=", "<", ">" (numeric-aware comparison), or plain equality.
+  bool matchValuePattern(const std::string& value, const std::string& pattern) const;
+  // The activation-rule evaluator's answer for |value| as the rule and |pattern| as the host's
+  // items.
+  bool matchDictionary(const value::Value& value, const value::Dictionary& pattern) const;
+
   // A new dictionary with the entries of |dictionary| whose keys do not begin with "DT".
   static value::Dictionary prunedInfoDictionaryFor(const value::Dictionary& dictionary);
 

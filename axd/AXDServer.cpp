@@ -2,7 +2,9 @@
 
 #include <unistd.h>
 
+#include "axd/AXDNames.h"
 #include "axd/AXDZynClient.h"
+#include "platform/launcher/ServiceLauncher.h"
 #include "platform/os/Log.h"
 
 namespace {
@@ -32,6 +34,7 @@ std::shared_ptr<AXDServer> AXDServer::initForService(const char* serviceName,
     return nullptr;
   }
   server->service_ = listener.value();
+  server->setDelegate(server);
   sharedServer() = server;
   std::weak_ptr<AXDServer> weak = server;
   server->service_->setEventHandler([weak](std::shared_ptr<zyn::Connection> connection) {
@@ -66,4 +69,67 @@ void AXDServer::debug(std::string_view format,
 
 void AXDServer::submitWork(std::function<void()> work) {
   mainQueue_->async(std::move(work));
+}
+
+bool AXDServer::holdOnPlugIn(const AXDPlugIn& plugIn) {
+  return syncQueue_->sync([&] {
+    for (const auto& hold : holds_) {
+      if (hold->blocks(plugIn)) return true;
+    }
+    return false;
+  });
+}
+
+void AXDServer::addHold(std::shared_ptr<AXDPlugInHold> hold) {
+  syncQueue_->sync([&] { holds_.push_back(std::move(hold)); });
+  postAnnotationChange();
+}
+
+void AXDServer::unholdToken(const value::Uuid& token) {
+  std::shared_ptr<AXDPlugInHold> released = syncQueue_->sync(
+      [&] { return takeHold([&](const AXDPlugInHold& hold) { return hold.uuid() == token; }); });
+  if (!released) return;
+  log("releasing plug-in hold %@ at client's request", {token.string()});
+  postAnnotationChange();
+}
+
+void AXDServer::unholdClient(const AXDZynClient& client) {
+  for (;;) {
+    std::shared_ptr<AXDPlugInHold> released = syncQueue_->sync(
+        [&] { return takeHold([&](const AXDPlugInHold& hold) { return hold.isHeldBy(client); }); });
+    if (!released) return;
+    log("releasing plug-in hold %@ for dead client pid %d",
+        {released->uuid().string(), client.pid()});
+    postAnnotationChange();
+  }
+}
+
+std::vector<std::shared_ptr<AXDPlugInHold>> AXDServer::holds() {
+  return syncQueue_->sync([&] { return holds_; });
+}
+
+std::shared_ptr<AXDPlugInHold> AXDServer::takeHold(
+    const std::function<bool(const AXDPlugInHold&)>& matches) {
+  for (auto it = holds_.begin(); it != holds_.end(); ++it) {
+    if (!matches(**it)) continue;
+    std::shared_ptr<AXDPlugInHold> hold = *it;
+    holds_.erase(it);
+    return hold;
+  }
+  return nullptr;
+}
+
+void AXDServer::removedPlugIns(const registrum::PlugInList& plugIns) {
+  std::weak_ptr<AXDServer> weak = std::static_pointer_cast<AXDServer>(shared_from_this());
+  for (const auto& record : plugIns) {
+    // The launcher keeps no service without both names, so there is nothing to withdraw.
+    const auto& id = record->bundleIdentifier();
+    const auto& version = record->bundleVersion();
+    if (!id || id->empty() || !version || version->empty()) continue;
+    auto completion = [weak, identifier = *id](int result) {
+      if (result == 0 || result == launcher::ServiceLauncher::kNoSuchService) return;
+      if (auto self = weak.lock()) self->log("PLUGIN REMOVAL:%@ RESULT:%d", {identifier, result});
+    };
+    launcher::ServiceLauncher::removeService(*id, *version, mainQueue_, completion);
+  }
 }

@@ -6,8 +6,11 @@
 #include <initializer_list>
 #include <memory>
 #include <string_view>
+#include <vector>
 
+#include "axd/AXDPlugInHold.h"
 #include "axd/AXDatabase.h"
+#include "axd/AXDatabaseDelegate.h"
 #include "platform/os/Format.h"
 #include "platform/zyn/Listener.h"
 #include "platform/zyn/StrandQueue.h"
@@ -17,8 +20,11 @@
 // The daemon's one service object: the plug-in database, the listener on the named service, and
 // the queues that order the daemon's work. New connections arrive on "zyn"; every request is
 // worked on "service", one at a time; "serverSync" guards the holds. Exactly one exists per
-// process; it lives until the process ends. log() and debug() may be called from any thread.
-class AXDServer : public AXDatabase, public std::enable_shared_from_this<AXDServer> {
+// process; it lives until the process ends. log(), debug() and the hold operations may be called
+// from any thread; each hold operation enters serverSync synchronously and nothing else.
+class AXDZynClient;
+
+class AXDServer : public AXDatabase, public AXDatabaseDelegate {
  public:
   // Builds the server for |serviceName| with the annotation file |databasePath| (null for the
   // default). Nothing when the database or the listener cannot be set up (logged). The listener
@@ -43,6 +49,23 @@ class AXDServer : public AXDatabase, public std::enable_shared_from_this<AXDServ
   // Schedules |work| on the service queue and returns at once.
   void submitWork(std::function<void()> work);
 
+  // ---- Holds ----------------------------------------------------------------------------------
+
+  // True when an active hold covers a record with |plugIn|'s UUID.
+  bool holdOnPlugIn(const AXDPlugIn& plugIn);
+  // Appends |hold| to the active holds (no check for overlaps), then posts the notification.
+  void addHold(std::shared_ptr<AXDPlugInHold> hold);
+  // Releases the hold with token |token| (logged, notification posted); nothing when none has it.
+  void unholdToken(const value::Uuid& token);
+  // Releases every hold placed by |client|, in list order, each logged and notified.
+  void unholdClient(const AXDZynClient& client);
+  // The active holds, in the order they were added.
+  std::vector<std::shared_ptr<AXDPlugInHold>> holds();
+
+  // Withdraws the launcher services of |plugIns| without waiting; failures other than "none
+  // registered" are logged from the service queue.
+  void removedPlugIns(const registrum::PlugInList& plugIns) override;
+
   std::uint32_t verbose() const { return verbose_.load(std::memory_order_relaxed); }
   void setVerbose(std::uint32_t verbose) { verbose_.store(verbose, std::memory_order_relaxed); }
 
@@ -54,9 +77,13 @@ class AXDServer : public AXDatabase, public std::enable_shared_from_this<AXDServ
  private:
   AXDServer() = default;
 
+  // Removes and returns the first hold that |matches|; null when none does. On serverSync.
+  std::shared_ptr<AXDPlugInHold> takeHold(const std::function<bool(const AXDPlugInHold&)>& matches);
+
   std::atomic<std::uint32_t> verbose_{0};
   std::shared_ptr<zyn::StrandQueue> zynQueue_;
   std::shared_ptr<zyn::ThreadQueue> mainQueue_;
   std::shared_ptr<zyn::Listener> service_;
   std::unique_ptr<zyn::SyncQueue> syncQueue_;
+  std::vector<std::shared_ptr<AXDPlugInHold>> holds_;  // guarded by syncQueue_
 };

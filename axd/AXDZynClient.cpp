@@ -103,6 +103,7 @@ void AXDZynClient::dying() {
 void AXDZynClient::dead() {
   server_->debug("client %d is dead", {pid()});
   acceptWork_.store(false);
+  server_->unholdClient(*this);
   os::Probes::clientDone(pid());
 }
 

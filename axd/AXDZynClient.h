@@ -37,7 +37,7 @@ class AXDZynClient : public std::enable_shared_from_this<AXDZynClient> {
 
   // The connection's termination-imminent event: a debug line; the client keeps working.
   void dying();
-  // The connection-invalid event: the client stops accepting work.
+  // The connection-invalid event: the client stops accepting work and its holds are released.
   void dead();
 
   std::string description() const;

@@ -16,7 +16,10 @@ struct Handler {
 };
 
 constexpr Handler kHandlers[] = {
+    {AXProtocol::kAdd, &Transaction::addPlugIns},
+    {AXProtocol::kRemove, &Transaction::removePlugIns},
     {AXProtocol::kBulk, &Transaction::bulkPlugIns},
+    {AXProtocol::kAnnotate, &Transaction::annotatePlugIns},
 };
 
 }  // namespace

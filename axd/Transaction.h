@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -10,6 +11,7 @@
 #include "platform/zyn/Message.h"
 #include "platform/zyn/Reply.h"
 
+class AXDPlugIn;
 class AXDServer;
 class AXDZynClient;
 namespace zyn {
@@ -43,11 +45,38 @@ class Transaction {
   std::shared_ptr<zyn::Connection> connection() const;
 
   // Request handlers: each ends the transaction with exactly one reply.
+  void addPlugIns();
+  void removePlugIns();
   void bulkPlugIns();
+  void annotatePlugIns();
+
+  // Called per path with the path and whether it could be resolved (the resolved path when it
+  // could, the path as given when not). Returns false to stop, having sent the failure reply.
+  using PathVisitor = std::function<bool(const std::string& path, bool resolved)>;
+  // Called per plug-in; returns false to stop, having sent the failure reply.
+  using PlugInVisitor = std::function<bool(const std::shared_ptr<AXDPlugIn>& plugIn)>;
+
+  // Walks "paths" in order. True when every path was accepted and visited with true; on a
+  // failure it detects itself it sends the failure reply. Sends nothing on success.
+  bool marshalPaths(const PathVisitor& visitor);
+  // marshalPaths(), then done() when it returned true.
+  bool processPaths(const PathVisitor& visitor);
+  // Walks "uuids" in order, looking each plug-in up. True when every element named a known
+  // plug-in and was visited with true; otherwise the failure reply has been sent. The caller
+  // sends the success reply.
+  bool processUuidList(const PlugInVisitor& visitor);
 
  private:
   // An integer field of the request; 0 when absent or not an unsigned integer.
   std::uint64_t integerField(const char* key) const;
+  // Visits the elements of the array |key| in order until |visit| returns false. Fails with
+  // code 4 and |invalid| when |key| is absent or not an array.
+  bool walkArray(const char* key, const char* invalid,
+                 const std::function<bool(const value::Value&)>& visit);
+  // One element of "paths": false (failure sent) when it is not an absolute path string.
+  bool visitPath(const value::Value& element, const PathVisitor& visitor);
+  // One element of "uuids": false (failure sent) when it names no plug-in.
+  bool visitUuid(const value::Value& element, const PlugInVisitor& visitor);
 
   const std::shared_ptr<AXDZynClient> client_;
   const value::Dictionary request_;

@@ -1,7 +1,6 @@
 #include <gtest/gtest.h>
 
 #include <filesystem>
-#include <set>
 
 #include "Annexa/AXPlugInCore.h"
 #include "LogCapture.h"
@@ -94,9 +93,7 @@ class AXPlugInCoreSdk : public ::testing::Test {
     std::filesystem::create_directories(root_ / "System/Library/SDKs");
     value::Value sdk = manifest(D({{"QSExtensionAttributes", D({{"a", I(1)}, {"b", I(2)}})},
                                    {"CleanTimeout", I(5)},
-                                   {"Shared", A({S("x")})},
-                                   {"QSExtensionProtocol", S("SdkProtocol")},
-                                   {"Subsystems", D({{"s", I(1)}})}}));
+                                   {"QSExtensionProtocol", S("SdkProtocol")}}));
     root_.write("System/Library/SDKs/com.example.point.plist",
                 value::PropertyList::toXml(sdk).value());
   }
@@ -108,18 +105,11 @@ class AXPlugInCoreSdk : public ::testing::Test {
 TEST_F(AXPlugInCoreSdk, ResolveMergesTheSdkUnderTheManifest) {
   auto r = record(kBundlePath, manifest(D({{"QSExtensionPointIdentifier", S("com.example.point")},
                                            {"QSExtensionAttributes", D({{"a", I(9)}})},
-                                           {"CleanTimeout", I(7)},
-                                           {"Shared", A({S("y")})}})));
+                                           {"CleanTimeout", I(7)}})));
   r->resolveSDK();
   EXPECT_EQ(attributesOf(*r), D({{"a", I(9)}, {"b", I(2)}, {"QSExtensionVersion", S("1")}}));
   EXPECT_EQ(r->pluginKey("CleanTimeout"), I(5));
   EXPECT_EQ(r->protocolSpec(), S("SdkProtocol"));
-  EXPECT_EQ(r->pluginKey("Subsystems"), D({{"s", I(1)}}));
-  value::Value sharedValue = *r->pluginKey("Shared");
-  const value::Array* shared = sharedValue.asArray();
-  ASSERT_TRUE(shared);
-  EXPECT_EQ(std::multiset<std::string>({*(*shared)[0].asString(), *(*shared)[1].asString()}),
-            (std::multiset<std::string>{"x", "y"}));
   // The merged manifest replaces the bundle information too; only the plug-in dictionary is
   // canonicalised.
   value::Value storedValue = *r->infoKey("QSExtension");

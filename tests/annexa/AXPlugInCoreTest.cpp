@@ -24,37 +24,6 @@ TEST(AXPlugInCoreSetup, RecordsWithoutUuidGetFreshOnes) {
   EXPECT_NE(*a->uuid(), *b->uuid());
   EXPECT_FALSE(*a == *b);
   EXPECT_TRUE(*a == *a);
-  EXPECT_EQ(a->identifier(), "com.example.tool");
-  EXPECT_EQ(a->path(), kAppexPath);
-}
-
-TEST(AXPlugInCoreSetup, WithoutUrlFailsSilently) {
-  LogCapture log;
-  EXPECT_EQ(AXPlugInCore::initWithName("com.example.tool", std::nullopt, std::nullopt, std::nullopt,
-                                       std::nullopt),
-            nullptr);
-  EXPECT_EQ(log.text(), "");
-}
-
-TEST(AXPlugInCoreSetup, WithoutIdentifierFailsAndLogs) {
-  LogCapture log;
-  EXPECT_EQ(AXPlugInCore::initWithName(std::nullopt, AXFileURL(kAppexPath), std::nullopt,
-                                       std::nullopt, std::nullopt),
-            nullptr);
-  EXPECT_NE(log.text().find("missing identifier in plug-in at /Apps/Host.app/PlugIns/Tool.appex\n"),
-            std::string::npos)
-      << log.text();
-}
-
-TEST(AXPlugInCoreSetup, NonDictionaryExtensionIsMalformed) {
-  LogCapture log;
-  value::Value info = manifest(S("oops"));
-  EXPECT_EQ(record(kAppexPath, info), nullptr);
-  std::string expected =
-      "malformed plug-in dictionary in plug-in com.example.tool at "
-      "file:///Apps/Host.app/PlugIns/Tool.appex: " +
-      info.description() + "\n";
-  EXPECT_NE(log.text().find(expected), std::string::npos) << log.text();
 }
 
 TEST(AXPlugInCoreSetup, InfoIsTheFallbackPlugInDictionary) {

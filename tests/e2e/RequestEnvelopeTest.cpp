@@ -25,43 +25,38 @@ AXDaemonClient::Request envelope(const char* type, std::uint64_t version) {
   return envelope(Value::string(type), Value::unsignedInteger(version));
 }
 
-TEST_F(DaemonTest, OnlyProtocolVersionsTwoAndThreeAreServed) {
+// The version is checked first, then the type: an unusable envelope gets the first error only.
+TEST_F(DaemonTest, TheEnvelopeIsCheckedVersionFirstThenType) {
   ASSERT_TRUE(start());
   BlockingClient client;
-  EXPECT_EQ(client.outcome(envelope(Value::string("bulk"), std::nullopt)),
-            "7: unsupported protocol version 0 (current 3)");
-  EXPECT_EQ(client.outcome(envelope("bulk", 1)), "7: unsupported protocol version 1 (current 3)");
-  EXPECT_EQ(client.outcome(envelope("bulk", 4)), "7: unsupported protocol version 4 (current 3)");
-  // The version is read as an unsigned integer: a signed integer or text is no version at all.
-  EXPECT_EQ(client.outcome(envelope(Value::string("bulk"), Value::integer(3))),
-            "7: unsupported protocol version 0 (current 3)");
-  EXPECT_EQ(client.outcome(envelope(Value::string("bulk"), Value::string("3"))),
-            "7: unsupported protocol version 0 (current 3)");
-  // All 64 bits count: a version whose low 32 bits read 3 is not version 3.
-  EXPECT_EQ(client.outcome(envelope("bulk", (std::uint64_t{1} << 32) + 3)).substr(0, 2), "7:");
-  EXPECT_EQ(client.outcome(envelope("bulk", 2)), "ok");
-  EXPECT_EQ(client.outcome(envelope("bulk", 3)), "ok");
-}
-
-TEST_F(DaemonTest, TheVersionIsCheckedBeforeTheRequestType) {
-  ASSERT_TRUE(start());
-  BlockingClient client;
-  EXPECT_EQ(client.outcome(envelope(std::nullopt, std::nullopt)),
-            "7: unsupported protocol version 0 (current 3)");
-  EXPECT_EQ(client.outcome(envelope("frobnicate", 1)),
-            "7: unsupported protocol version 1 (current 3)");
-}
-
-TEST_F(DaemonTest, TheRequestTypeMustBeAStringNamingAServedRequest) {
-  ASSERT_TRUE(start());
-  BlockingClient client;
-  const Value version = Value::unsignedInteger(3);
-  EXPECT_EQ(client.outcome(envelope(std::nullopt, version)),
-            "4: invalid request format (missing type)");
-  EXPECT_EQ(client.outcome(envelope(Value::unsignedInteger(3), version)),
-            "4: invalid request format (missing type)");
-  for (const char* type : {"BULK", "Bulk", "bulk ", "", "frobnicate", "match"}) {
-    EXPECT_EQ(client.outcome(envelope(type, 3)), "4: unrecognized request") << type;
+  const std::string noVersion = "7: unsupported protocol version 0 (current 3)";
+  const Value bulk = Value::string("bulk");
+  const Value three = Value::unsignedInteger(3);
+  const std::vector<std::pair<AXDaemonClient::Request, std::string>> cases = {
+      {envelope(bulk, std::nullopt), noVersion},
+      {envelope("bulk", 1), "7: unsupported protocol version 1 (current 3)"},
+      {envelope("bulk", 4), "7: unsupported protocol version 4 (current 3)"},
+      // Read as an unsigned integer: a signed integer or text is no version at all.
+      {envelope(bulk, Value::integer(3)), noVersion},
+      {envelope(bulk, Value::string("3")), noVersion},
+      // All 64 bits count: a version whose low 32 bits read 3 is not version 3.
+      {envelope("bulk", (std::uint64_t{1} << 32) + 3),
+       "7: unsupported protocol version 4294967299 (current 3)"},
+      {envelope("bulk", 2), "ok"},
+      {envelope("bulk", 3), "ok"},
+      {envelope(std::nullopt, std::nullopt), noVersion},
+      {envelope("frobnicate", 1), "7: unsupported protocol version 1 (current 3)"},
+      {envelope(std::nullopt, three), "4: invalid request format (missing type)"},
+      {envelope(three, three), "4: invalid request format (missing type)"},
+      {envelope("BULK", 3), "4: unrecognized request"},
+      {envelope("bulk ", 3), "4: unrecognized request"},
+      {envelope("", 3), "4: unrecognized request"},
+      {envelope("frobnicate", 3), "4: unrecognized request"},
+      {envelope("match", 3), "4: unrecognized request"},
+  };
+  for (const auto& [request, expected] : cases) {
+    SCOPED_TRACE(Value::dictionary(value::Dictionary(request)).description());
+    EXPECT_EQ(client.outcome(request), expected);
   }
 }
 

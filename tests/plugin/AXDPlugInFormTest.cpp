@@ -184,17 +184,15 @@ TEST_F(AXDPlugInNameTest, DisplayNamesComeFromTheRegistryUnlessSet) {
   EXPECT_EQ(*form.find("localizedDisplayName"), S("Tool"));
 
   auto preset = named("Tool", "T");
-  preset->setLocalizedName("Mine");
+  preset->setLocalizedName("Mine");  // before the first read, which must not overwrite it
   EXPECT_EQ(preset->localizedName(), "Mine");
-}
 
-TEST_F(AXDPlugInNameTest, AnAbsentNameLeavesTheCacheEmpty) {
-  auto record = named(std::nullopt, std::nullopt);
-  ASSERT_TRUE(record);
-  EXPECT_FALSE(record->localizedName());
-  EXPECT_FALSE(record->localizedShortName());
-  record->setLocalizedShortName("Later");
-  EXPECT_EQ(record->localizedShortName(), "Later");
+  auto unnamed = named(std::nullopt, std::nullopt);
+  ASSERT_TRUE(unnamed);
+  EXPECT_FALSE(unnamed->localizedName());
+  EXPECT_FALSE(unnamed->localizedShortName());
+  unnamed->setLocalizedShortName("Later");
+  EXPECT_EQ(unnamed->localizedShortName(), "Later");
 }
 
 TEST_F(AXDPlugInNameTest, ConcurrentFirstReadsAgree) {

@@ -37,28 +37,19 @@ TEST_F(AXDPlugInTest, TheRecordTakesItsFactsFromTheRegistry) {
   fields.originalIdentifier = "com.example.original";
   fields.entitlements = value::Dictionary{{"e", value::Value::boolean(true)}};
   fields.onSystemPartition = true;
-  value::Uuid uuid = fields.uuid;
-  auto record = build(fields);
-  ASSERT_TRUE(record);
-  EXPECT_EQ(record->identifier(), kIdentifier);
-  EXPECT_EQ(record->path(), kSystemPath);
-  EXPECT_EQ(record->uuid(), uuid);
-  EXPECT_EQ(record->originalIdentifier(), "com.example.original");
-  EXPECT_EQ(record->entitlements(), fields.entitlements);
-  EXPECT_TRUE(record->onSystemVolume());
-  EXPECT_EQ(record->plugInDictionary(), fields.plugInDictionary);
-  EXPECT_EQ(record->bundleInfoDictionary(), fields.infoDictionary);
-  EXPECT_FALSE(record->containingUrl());
-  EXPECT_EQ(record->rgproxy()->uuid(), uuid);
-}
-
-TEST_F(AXDPlugInTest, LookupsAskTheRegistryRecord) {
-  PlugInRecord::Fields fields = plugIn(kSystemPath);
   // The raw Info.plist and the resolved plug-in dictionary differ, as after an SDK merge.
   fields.infoDictionary = fields.infoDictionary.with("Raw", S("info"));
   fields.plugInDictionary = fields.plugInDictionary.with("Resolved", S("sdk"));
   auto record = build(fields);
   ASSERT_TRUE(record);
+  EXPECT_EQ(record->identifier(), kIdentifier);
+  EXPECT_EQ(record->path(), kSystemPath);
+  EXPECT_EQ(record->uuid(), fields.uuid);
+  EXPECT_EQ(record->originalIdentifier(), "com.example.original");
+  EXPECT_EQ(record->entitlements(), fields.entitlements);
+  EXPECT_TRUE(record->onSystemVolume());
+  EXPECT_FALSE(record->containingUrl());
+  EXPECT_EQ(record->rgproxy()->uuid(), fields.uuid);
   EXPECT_EQ(record->infoKey("Raw"), S("info"));
   EXPECT_FALSE(record->infoKey("Resolved"));
   EXPECT_EQ(record->pluginKey("Resolved"), S("sdk"));

@@ -68,42 +68,32 @@ TEST_F(SandboxExtensionTest, IssueConsumeReleaseRoundTrip) {
   EXPECT_EQ(Sandbox::release(0).error().errnum, EBADF);
 }
 
-TEST_F(SandboxExtensionTest, ATokenNamesTheCanonicalPath) {
+TEST_F(SandboxExtensionTest, ATokenNamesTheCanonicalPathUnlessAskedToTakeItAsGiven) {
   directory("dir/sub");
   std::filesystem::create_symlink(file_, root_ / "link");
+  std::string odd = root_.write("a;b\nc d", "x");
   EXPECT_EQ(grantedPath(issue(root_ / "link")), canonical(file_));
   EXPECT_EQ(grantedPath(issue(root_ / "dir/sub/../../file.txt")), canonical(file_));
-}
-
-TEST_F(SandboxExtensionTest, AnyByteOfThePathSurvives) {
-  std::string odd = root_.write("a;b\nc d", "x");
-  EXPECT_EQ(grantedPath(issue(odd)), canonical(odd));
-}
-
-TEST_F(SandboxExtensionTest, WithoutCanonicalisationThePathIsTakenAsGiven) {
-  std::filesystem::create_symlink(file_, root_ / "link");
-  os::Result<std::string> token =
+  EXPECT_EQ(grantedPath(issue(odd)), canonical(odd));  // any byte of the path survives
+  os::Result<std::string> asGiven =
       Sandbox::issueFileExtension(sandbox::kReadExtensionClass, root_ / "link", false);
-  ASSERT_TRUE(token.ok());
-  EXPECT_EQ(grantedPath(token.value()), root_ / "link");
-
-  auto relative = Sandbox::issueFileExtension(sandbox::kReadExtensionClass, "file.txt", false);
-  EXPECT_EQ(relative.error().errnum, EINVAL);
-  auto missing = Sandbox::issueFileExtension(sandbox::kReadExtensionClass, root_ / "no", false);
-  EXPECT_EQ(missing.error().errnum, ENOENT);
+  ASSERT_TRUE(asGiven.ok());
+  EXPECT_EQ(grantedPath(asGiven.value()), root_ / "link");
 }
 
 TEST_F(SandboxExtensionTest, IssuingFailsWithTheErrorOfRealpath) {
-  auto missing = Sandbox::issueFileExtension(sandbox::kReadExtensionClass, root_ / "no", true);
-  ASSERT_FALSE(missing.ok());
-  EXPECT_EQ(missing.error().errnum, ENOENT);
-  auto throughFile =
-      Sandbox::issueFileExtension(sandbox::kReadExtensionClass, file_ + "/inside", true);
-  EXPECT_EQ(throughFile.error().errnum, ENOTDIR);
-  EXPECT_EQ(Sandbox::issueFileExtension(sandbox::kReadExtensionClass, "", true).error().errnum,
-            ENOENT);
-  EXPECT_EQ(Sandbox::issueFileExtension("", file_, true).error().errnum, EINVAL);
-  EXPECT_EQ(Sandbox::issueFileExtension("a;b", file_, true).error().errnum, EINVAL);
+  auto errnum = [](const std::string& extensionClass, const std::string& path, bool canonicalize) {
+    auto token = Sandbox::issueFileExtension(extensionClass, path, canonicalize);
+    return token.ok() ? 0 : token.error().errnum;
+  };
+  const std::string read = sandbox::kReadExtensionClass;
+  EXPECT_EQ(errnum(read, root_ / "no", true), ENOENT);
+  EXPECT_EQ(errnum(read, root_ / "no", false), ENOENT);
+  EXPECT_EQ(errnum(read, file_ + "/inside", true), ENOTDIR);
+  EXPECT_EQ(errnum(read, "", true), ENOENT);
+  EXPECT_EQ(errnum(read, "file.txt", false), EINVAL);  // relative, taken as given
+  EXPECT_EQ(errnum("", file_, true), EINVAL);
+  EXPECT_EQ(errnum("a;b", file_, true), EINVAL);
 }
 
 TEST_F(SandboxExtensionTest, AlteredTokensAreRefused) {
@@ -121,12 +111,6 @@ TEST_F(SandboxExtensionTest, AlteredTokensAreRefused) {
 
   std::string otherClass = "v1;other.class" + token.substr(token.find(';', 3));
   EXPECT_EQ(consumeError(otherClass), EPERM);
-
-  std::string forged = Sandbox::issueFileExtension(sandbox::kReadExtensionClass, file_, true)
-                           .value()
-                           .substr(0, macStart) +
-                       std::string(64, 'a');
-  EXPECT_EQ(consumeError(forged), EPERM);
 }
 
 TEST_F(SandboxExtensionTest, MalformedTokensAreInvalid) {

@@ -2,9 +2,11 @@
 
 #include <CLI/CLI.hpp>
 #include <cstdio>
+#include <limits>
 
 #include "Annexa/AXProtocol.h"
 #include "tools/axctl/Axctl.h"
+#include "tools/axctl/NotificationPrinter.h"
 
 namespace {
 
@@ -33,7 +35,9 @@ std::optional<value::Dictionary> parseRule(const std::vector<std::string>& pairs
 }  // namespace
 
 int main(int argc, char** argv) {
-  CLI::App app{"axctl: send requests to the Annexa plug-in daemon (axd) and print the replies."};
+  CLI::App app{
+      "axctl: send requests to the Annexa plug-in daemon (axd) and print the replies, or watch "
+      "a system-wide notification."};
   app.require_subcommand(1);
   Axctl::Options options;
   app.add_option(
@@ -50,6 +54,8 @@ int main(int argc, char** argv) {
   std::optional<std::int64_t> election;
   bool apps = false;
   bool bundles = false;
+  std::string notification;
+  std::optional<unsigned> count;
 
   auto* add = app.add_subcommand("add", "register the plug-in bundles at PATH...");
   add->add_option("paths", paths, "absolute paths of plug-in bundles");
@@ -82,8 +88,16 @@ int main(int argc, char** argv) {
   holdKind->require_option(1);
   auto* release = app.add_subcommand("release", "release the hold with token UUID");
   release->add_option("uuids", uuidTexts, "the hold's token")->required()->expected(1);
+  auto* watch = app.add_subcommand(
+      "watch",
+      "print a line (NAME and local time) per post of notification NAME; no daemon needed");
+  watch->add_option("name", notification, "e.g. " AXD_VENDOR_PREFIX ".annexa.annotation-change")
+      ->required();
+  watch->add_option("--count", count, "exit after N posts (default: run until SIGINT or SIGTERM)")
+      ->check(CLI::Range(1u, std::numeric_limits<unsigned>::max()));
 
   CLI11_PARSE(app, argc, argv);
+  if (*watch) return NotificationPrinter::watch(notification, count);
 
   try {
     Axctl axctl(options);

@@ -1,0 +1,162 @@
+#include "axd/AXDAnnotationStore.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <fstream>
+#include <map>
+
+#include "Annexa/AXInternalConsistency.h"
+#include "axd/AXDPlugIn.h"
+#include "platform/os/AtomicFile.h"
+#include "platform/os/Format.h"
+#include "platform/os/Log.h"
+#include "platform/os/Paths.h"
+#include "platform/os/Probes.h"
+#include "platform/value/PropertyList.h"
+#include "platform/value/Value.h"
+
+namespace {
+
+constexpr std::string_view kSource = "axd/AXDAnnotationStore";
+constexpr std::int64_t kVersionErrorCode = 7;
+
+AXError posixError(const os::Error& error) {
+  return AXError(AXPOSIXErrorDomain, error.errnum, error.message);
+}
+
+AXError unparsable(const std::string& path, const std::string& why) {
+  return AXError(AXPOSIXErrorDomain, EINVAL, path + ": not an annotation database: " + why);
+}
+
+// The error that rejects |top| as the contents of the file |path|, or nothing when its "data"
+// is a usable table.
+std::optional<AXError> rejection(const std::string& path, const value::Dictionary& top) {
+  const value::Value* version = top.find("version");
+  std::int64_t found = version ? version->integerValue().value_or(0) : 0;
+  if (found != AXDAnnotationStore::kVersion) {
+    return AXMakeErrorWithFormat(kVersionErrorCode, "found database version %d needed version %d",
+                                 {found, AXDAnnotationStore::kVersion});
+  }
+  const value::Value* data = top.find("data");
+  if (!data) return unparsable(path, "it has no \"data\"");
+  if (!data->asDictionary()) return unparsable(path, "its \"data\" is not a dictionary");
+  for (const auto& [key, annotation] : *data->asDictionary()) {
+    if (!annotation.asDictionary()) {
+      return unparsable(path, "the annotation of \"" + key + "\" is not a dictionary");
+    }
+  }
+  return std::nullopt;
+}
+
+// The annotation table in the file |path| into |table|, or the error that rejects the file.
+std::optional<AXError> readTable(const std::string& path, value::Dictionary* table) {
+  os::Result<value::Value> read = value::PropertyList::readFile(path);
+  if (!read.ok()) return posixError(read.error());
+  const value::Dictionary* top = read.value().asDictionary();
+  if (!top) return unparsable(path, "its top level is not a dictionary");
+  std::optional<AXError> rejected = rejection(path, *top);
+  if (!rejected) *table = *top->find("data")->asDictionary();
+  return rejected;
+}
+
+// The process's file-creation mask. Read from /proc because umask(2) can only read it by
+// changing it, which would briefly give files made by other threads the wrong mode. Without
+// /proc, 077: the temporary file's own mode 0600 stays.
+mode_t creationMask() {
+  std::ifstream status("/proc/self/status");
+  std::string line;
+  while (std::getline(status, line)) {
+    if (line.rfind("Umask:", 0) == 0) {
+      return static_cast<mode_t>(std::strtoul(line.c_str() + 6, nullptr, 8));
+    }
+  }
+  return 077;
+}
+
+}  // namespace
+
+AXDAnnotationStore::AXDAnnotationStore(const char* path)
+    : annotationsURL_(path ? std::string(path) : defaultDatabaseURL()) {
+  std::optional<AXError> error;
+  if (loadDb(&error)) return;
+  if (error->domain() == AXPOSIXErrorDomain && error->code() == ENOENT) return;
+  os::Log::write(5, os::format("unable to load annotation database:%@ error:%@ (resetting)",
+                               {annotationsURL_, error->description()}));
+}
+
+std::string AXDAnnotationStore::defaultDatabaseURL() {
+  std::string perUser = os::Paths::perUserDir(geteuid());
+  if (perUser.empty()) {
+    AXInternalInconsistencyFailure(os::format("unable to locate user directory: errno %d", {errno}),
+                                   kSource);
+  }
+  std::string directory = perUser + "/" + AXD_VENDOR_PREFIX + ".annexa";
+  os::Status made = os::Paths::ensureDirectory(directory, 0700);
+  if (!made.ok()) {
+    AXInternalInconsistencyFailure(
+        os::format("unable to create plugin annotations directory:%@ error:%@",
+                   {directory, posixError(made.error()).description()}),
+        kSource);
+  }
+  return directory + "/Annotations";
+}
+
+std::optional<value::Dictionary> AXDAnnotationStore::annotationForIdentifier(
+    const std::string& key) const {
+  const value::Value* annotation = annotations_.find(key);
+  if (!annotation || !annotation->asDictionary()) return std::nullopt;
+  return *annotation->asDictionary();
+}
+
+std::optional<value::Dictionary> AXDAnnotationStore::annotationForPlugIn(
+    const AXDPlugIn& plugIn) const {
+  return annotationForIdentifier(plugIn.annotationKey());
+}
+
+void AXDAnnotationStore::setAnnotation(const std::optional<value::Dictionary>& annotation,
+                                       const AXDPlugIn& plugIn) {
+  std::string key = plugIn.annotationKey();
+  if (annotation) {
+    std::map<std::string, value::Value> merged =
+        annotationForIdentifier(key).value_or(value::Dictionary()).toMap();
+    for (const auto& [name, entry] : *annotation) merged.insert_or_assign(name, entry);
+    annotations_ = annotations_.with(key, value::Value::dictionary(value::Dictionary(merged)));
+  } else {
+    annotations_ = annotations_.without(key);
+  }
+  std::optional<AXError> error;
+  if (saveDb(&error)) return;
+  os::Log::write(5, os::format("unable to save annotations:%@ error:%@",
+                               {annotationsURL_, error->description()}));
+}
+
+bool AXDAnnotationStore::loadDb(std::optional<AXError>* error) {
+  value::Dictionary table;
+  std::optional<AXError> failure = readTable(annotationsURL_, &table);
+  if (!failure) {
+    annotations_ = std::move(table);
+    return true;
+  }
+  os::Probes::dbLoad(failure->domain().c_str(), static_cast<std::uint64_t>(failure->code()));
+  if (error) *error = std::move(failure);
+  return false;
+}
+
+bool AXDAnnotationStore::saveDb(std::optional<AXError>* error) {
+  value::Value top = value::Value::dictionary({
+      {"data", value::Value::dictionary(annotations_)},
+      {"version", value::Value::integer(kVersion)},
+  });
+  os::Result<std::string> xml = value::PropertyList::toXml(top);
+  os::Status written = xml.ok() ? os::AtomicFile::replace(annotationsURL_, xml.value(),
+                                                          os::AtomicFile::Durability::Durable,
+                                                          0666 & ~creationMask())
+                                : xml.error();
+  if (written.ok()) return true;
+  if (error) *error = posixError(written.error());
+  return false;
+}

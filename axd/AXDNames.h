@@ -1,0 +1,18 @@
+#pragma once
+
+#include <string>
+
+// The vendor-prefixed names that the daemon itself tests or posts.
+namespace AXDNames {
+
+// Entitlement of a client allowed to manage plug-ins (remove them, discover everything).
+inline const std::string kManagerEntitlement = AXD_VENDOR_PREFIX ".private.annexa.manager";
+// Plug-in entitlement: elect the plug-in when its record is first built.
+inline const std::string kAutoElectEntitlement = AXD_VENDOR_PREFIX ".developer.auto-elect-plugin";
+// Plug-in entitlement: a string naming the plug-in whose annotations this one shares.
+inline const std::string kReplacePlugInEntitlement = AXD_VENDOR_PREFIX ".developer.replace-plugin";
+// Posted after every change of annotations or holds, so that hosts query again.
+inline const std::string kAnnotationChangeNotification =
+    AXD_VENDOR_PREFIX ".annexa.annotation-change";
+
+}  // namespace AXDNames

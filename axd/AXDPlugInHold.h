@@ -1,0 +1,48 @@
+#pragma once
+
+#include <chrono>
+#include <memory>
+#include <unordered_set>
+#include <vector>
+
+#include "axd/AXDPlugIn.h"
+#include "platform/value/Uuid.h"
+
+class AXDZynClient;
+
+// A hold: a set of plug-ins kept from discovery and from being made ready while the client that
+// placed it works on them. Identified by its token, a fresh random UUID. While it exists it
+// takes one count of the process's open-work counter. Immutable after construction; safe to
+// read from any thread.
+class AXDPlugInHold {
+ public:
+  using Blocked =
+      std::unordered_set<std::shared_ptr<const AXPlugInCore>, AXPlugInCoreHash, AXPlugInCoreEqual>;
+
+  // A hold on |plugIns| (duplicates collapse) for |client|, held weakly.
+  AXDPlugInHold(const std::vector<std::shared_ptr<AXDPlugIn>>& plugIns,
+                const std::shared_ptr<AXDZynClient>& client);
+  ~AXDPlugInHold();
+  AXDPlugInHold(const AXDPlugInHold&) = delete;
+  AXDPlugInHold& operator=(const AXDPlugInHold&) = delete;
+
+  const value::Uuid& uuid() const { return uuid_; }
+  const Blocked& blocked() const { return blocked_; }
+  // The client that placed the hold; null once that client object is gone.
+  std::shared_ptr<AXDZynClient> client() const { return client_.lock(); }
+  std::chrono::system_clock::time_point created() const { return created_; }
+
+  // True when the hold covers a record with |plugIn|'s UUID.
+  bool blocks(const AXDPlugIn& plugIn) const;
+  // True when |client| is the client that placed the hold (and still exists).
+  bool isHeldBy(const AXDZynClient& client) const;
+
+  bool isEqual(const AXDPlugInHold& other) const { return uuid_ == other.uuid_; }
+  std::size_t hash() const { return value::UuidHash()(uuid_); }
+
+ private:
+  const value::Uuid uuid_;
+  const Blocked blocked_;
+  const std::weak_ptr<AXDZynClient> client_;
+  const std::chrono::system_clock::time_point created_;
+};

@@ -1,0 +1,63 @@
+// The election restriction: pattern normalisation and the election text of a candidate.
+
+#include <gtest/gtest.h>
+
+#include "axd/AXDElectionFilter.h"
+#include "axd/AXDNames.h"
+
+namespace {
+
+using value::Dictionary;
+using value::Value;
+
+TEST(AXDElectionFilterTest, PatternsAreNormalisedByTheirFirstCharacter) {
+  struct Case {
+    Value pattern;
+    std::optional<std::string> expected;
+  } cases[] = {
+      {Value::string("1"), "1"},
+      {Value::string("=1"), "1"},
+      {Value::string("="), ""},
+      {Value::string("01"), "01"},
+      {Value::string("é"), "é"},
+      {Value::string("\u0301x"), "\u0301x"},  // a mark
+      {Value::string("٣"), "٣"},
+      {Value::string("-1"), std::nullopt},
+      {Value::string(""), std::nullopt},
+      {Value::string(" 1"), std::nullopt},
+      {Value::string("€1"), std::nullopt},
+      {Value::integer(1), std::nullopt},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.pattern.description());
+    EXPECT_EQ(AXDElectionFilter::normalizedPattern(c.pattern), c.expected);
+  }
+}
+
+TEST(AXDElectionFilterTest, TheElectionTextIsTheLowByteOrTheAutoElectDefault) {
+  const Dictionary none;
+  auto elected = [](Value election) { return Dictionary{{"election", election}}; };
+  auto entitled = [](Value value) { return Dictionary{{AXDNames::kAutoElectEntitlement, value}}; };
+  struct Case {
+    std::optional<Dictionary> annotation;
+    Dictionary entitlements;
+    std::string expected;
+  } cases[] = {
+      {elected(Value::integer(1)), none, "1"},
+      {elected(Value::integer(-1)), none, "255"},
+      {elected(Value::integer(257)), none, "1"},
+      {elected(Value::real(2.7)), none, "2"},
+      {elected(Value::integer(0)), entitled(Value::boolean(true)), "0"},
+      {std::nullopt, entitled(Value::boolean(true)), "1"},
+      {std::nullopt, entitled(Value::integer(2)), "1"},
+      {std::nullopt, entitled(Value::string("yes")), "0"},
+      {std::nullopt, entitled(Value::boolean(false)), "0"},
+      {Dictionary{{"extension", Value::dictionary({})}}, none, "0"},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.expected);
+    EXPECT_EQ(AXDElectionFilter::electionText(c.annotation, c.entitlements), c.expected);
+  }
+}
+
+}  // namespace
