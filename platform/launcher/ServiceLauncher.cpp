@@ -3,6 +3,7 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <signal.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -12,13 +13,14 @@
 #include <optional>
 #include <tuple>
 
+#include "platform/launcher/CleanSpawn.h"
+#include "platform/launcher/ServiceFile.h"
 #include "platform/launcher/ServiceName.h"
 #include "platform/launcher/TableLock.h"
 #include "platform/os/AtomicFile.h"
 #include "platform/os/Format.h"
 #include "platform/os/Log.h"
 #include "platform/os/Paths.h"
-#include "platform/value/PropertyList.h"
 #include "platform/value/Value.h"
 
 namespace launcher {
@@ -40,6 +42,11 @@ std::string serviceDir(const std::string& bundleIdentifier, const std::string& v
          ServiceName::escape(version);
 }
 
+std::string serviceFile(const std::string& bundleIdentifier, const std::string& version,
+                        pid_t host) {
+  return serviceDir(bundleIdentifier, version) + "/" + std::to_string(host) + std::string(kSuffix);
+}
+
 os::Status checkNames(const std::string& bundleIdentifier, const std::string& version) {
   if (!bundleIdentifier.empty() && !version.empty()) return os::success();
   return os::Error{EINVAL, "launcher: empty bundle identifier or version"};
@@ -50,6 +57,21 @@ os::Status checkNames(const std::string& bundleIdentifier, const std::string& ve
 os::Status checkHost(pid_t host) {
   if (host > 0 && (kill(host, 0) == 0 || errno == EPERM)) return os::success();
   return os::Error{ESRCH, os::format("launcher: no process %d", {host})};
+}
+
+// Refuses at addition what exec would refuse at start. A relative path would be resolved against
+// the host's working directory, not ours.
+os::Status checkExecutable(const std::string& path) {
+  if (!path.starts_with('/') || path.find('\0') != std::string::npos) {
+    return os::Error{EINVAL, "launcher: executable path is not absolute: " + path};
+  }
+  struct stat status;
+  if (stat(path.c_str(), &status) != 0) return os::Error::fromErrno("launcher: stat " + path);
+  if (!S_ISREG(status.st_mode)) return os::Error{EACCES, "launcher: not a regular file: " + path};
+  if (faccessat(AT_FDCWD, path.c_str(), X_OK, AT_EACCESS) != 0) {
+    return os::Error::fromErrno("launcher: execute " + path);
+  }
+  return os::success();
 }
 
 // The host of a service file name "<pid>.plist" (pid in its one decimal spelling), or nothing.
@@ -84,13 +106,6 @@ void skip(const std::string& path, const std::string& why) {
   os::Log::write(kLogWarning, "launcher: skipping " + path + ": " + why);
 }
 
-os::Result<value::Dictionary> readDescription(const std::string& path) {
-  os::Result<value::Value> read = value::PropertyList::readFile(path);
-  if (!read.ok()) return read.error();
-  if (const value::Dictionary* description = read.value().asDictionary()) return *description;
-  return os::Error{EINVAL, path + ": not a dictionary"};
-}
-
 // Appends the services in |dir|, the directory of one identifier and version.
 void collectHosts(const std::string& dir, const std::string& bundleIdentifier,
                   const std::string& version, std::vector<Service>& out) {
@@ -105,12 +120,13 @@ void collectHosts(const std::string& dir, const std::string& bundleIdentifier,
       skip(dir + "/" + name, "not a service file");
       continue;
     }
-    os::Result<value::Dictionary> description = readDescription(dir + "/" + name);
-    if (!description.ok()) {
-      skip(dir + "/" + name, description.error().message);
+    os::Result<ServiceFile::Contents> read = ServiceFile::read(dir + "/" + name);
+    if (!read.ok()) {
+      skip(dir + "/" + name, read.error().message);
       continue;
     }
-    out.push_back({*host, bundleIdentifier, version, std::move(description).value()});
+    out.push_back({*host, bundleIdentifier, version, std::move(read.value().executablePath),
+                   std::move(read.value().description)});
   }
 }
 
@@ -157,15 +173,53 @@ int removeLocked(const std::string& bundleIdentifier, const std::string& version
   return removed ? 0 : ServiceLauncher::kNoSuchService;
 }
 
+// The service recorded for this process, read with the table locked shared. A missing table,
+// directory or file all mean that this process was not made ready for the service.
+os::Result<ServiceFile::Contents> readOwnService(const std::string& bundleIdentifier,
+                                                 const std::string& version) {
+  const pid_t self = getpid();
+  os::Result<TableLock> lock = TableLock::acquire(tableDir(), TableLock::Mode::Shared);
+  if (!lock.ok() && lock.error().errnum != ENOENT) return lock.error();
+  if (lock.ok()) {
+    os::Result<ServiceFile::Contents> read =
+        ServiceFile::read(serviceFile(bundleIdentifier, version, self));
+    const int errnum = read.ok() ? 0 : read.error().errnum;
+    if (errnum != ENOENT && errnum != ENOTDIR && errnum != ENAMETOOLONG) return read;
+  }
+  return os::Error{EPERM, os::format("launcher: process %d was not made ready for %s %s",
+                                     {self, bundleIdentifier, version})};
+}
+
+// "NAME=value" for each string entry of the description's "ZynService" "EnvironmentVariables".
+std::vector<std::string> environmentOf(const value::Dictionary& description) {
+  std::vector<std::string> environment;
+  const value::Value* service = description.find("ZynService");
+  const value::Dictionary* settings = service ? service->asDictionary() : nullptr;
+  const value::Value* variables = settings ? settings->find("EnvironmentVariables") : nullptr;
+  if (!variables || !variables->asDictionary()) return environment;
+  for (const auto& [name, value] : *variables->asDictionary()) {
+    // A name with '=' would read back as another variable.
+    if (!value.asString() || name.empty() || name.find('=') != std::string::npos) {
+      os::Log::write(kLogWarning, "launcher: skipping environment entry \"" + name +
+                                      "\": not a variable name with a string value");
+      continue;
+    }
+    environment.push_back(name + "=" + *value.asString());
+  }
+  return environment;
+}
+
 }  // namespace
 
 os::Status ServiceLauncher::addService(pid_t host, const std::string& bundleIdentifier,
                                        const std::string& version,
+                                       const std::string& executablePath,
                                        const value::Dictionary& description) {
   os::Status valid = checkNames(bundleIdentifier, version);
   if (valid.ok()) valid = checkHost(host);
+  if (valid.ok()) valid = checkExecutable(executablePath);
   if (!valid.ok()) return valid;
-  os::Result<std::string> xml = value::PropertyList::toXml(value::Value::dictionary(description));
+  os::Result<std::string> xml = ServiceFile::encode({executablePath, description});
   if (!xml.ok()) return xml.error();
   os::Status made = os::Paths::ensureDirectory(tableDir(), 0700);
   if (!made.ok()) return made;
@@ -175,8 +229,18 @@ os::Status ServiceLauncher::addService(pid_t host, const std::string& bundleIden
   made = os::Paths::ensureDirectory(dir, 0700);
   if (!made.ok()) return made;
   // No fsync: the runtime directory does not outlive a reboot.
-  return os::AtomicFile::replace(dir + "/" + std::to_string(host) + std::string(kSuffix),
-                                 xml.value(), os::AtomicFile::Durability::Volatile);
+  return os::AtomicFile::replace(serviceFile(bundleIdentifier, version, host), xml.value(),
+                                 os::AtomicFile::Durability::Volatile);
+}
+
+os::Result<pid_t> ServiceLauncher::start(const std::string& bundleIdentifier,
+                                         const std::string& version) {
+  os::Status valid = checkNames(bundleIdentifier, version);
+  if (!valid.ok()) return valid.error();
+  os::Result<ServiceFile::Contents> service = readOwnService(bundleIdentifier, version);
+  if (!service.ok()) return service.error();
+  return CleanSpawn::run(service.value().executablePath,
+                         environmentOf(service.value().description));
 }
 
 int ServiceLauncher::removeService(const std::string& bundleIdentifier,

@@ -13,18 +13,22 @@
 
 namespace launcher {
 
-// The service launcher's table: which host process may use which plug-in service, and the
-// description the plug-in is run under. A service is the triple (host pid, bundle identifier,
-// version); its description lives in
+// The service launcher's table: which host process may start which plug-in, from which
+// executable and under which description. A service is the triple (host pid, bundle identifier,
+// version); its executable and description live in
 //   <runtime dir>/launcher/<escaped identifier>/<escaped version>/<host pid>.plist
-// as an XML property list (escaping as in ServiceName). The table is the files: every process
-// on the same device root sees the same services.
+// (format in ServiceFile, escaping in ServiceName). The table is the files: every process on the
+// same device root sees the same services.
 //
-// Stateless; safe to call from any thread and any number of processes at once. Additions and
-// listings hold the table lock shared, removals exclusive (TableLock): an addition and a removal
-// of the same service take effect in the order they took the lock, so whichever comes last
-// wins, and a listing sees each removal whole or not at all. Files are written to a temporary
-// name and renamed into place, so a reader never sees half a description.
+// A description is a dictionary whose "ZynService" dictionary may hold "EnvironmentVariables"
+// (the plug-in's whole environment) and "_SandboxProfile" (the name of its sandbox profile,
+// recorded here but not yet applied at start).
+//
+// Stateless; safe to call from any thread and any number of processes at once. Additions,
+// listings and starts hold the table lock shared, removals exclusive (TableLock): an addition and
+// a removal of the same service take effect in the order they took the lock, so whichever comes
+// last wins, and a listing or start sees each removal whole or not at all. Files are written to
+// a temporary name and renamed into place, so a reader never sees half a record.
 class ServiceLauncher {
  public:
   // The result removeService reports when no host had the service (ESRCH's number).
@@ -34,16 +38,30 @@ class ServiceLauncher {
     pid_t host;
     std::string bundleIdentifier;
     std::string version;
+    std::string executablePath;
     value::Dictionary description;
   };
 
-  // Records |description| (written as an XML property list) for |host|. Fails with ESRCH when
-  // no process |host| exists, EINVAL for an empty identifier or version or a description that a
-  // property list cannot hold, or the errno of the file operation (ENAMETOOLONG when an escaped
-  // identifier or version exceeds a file name). Replaces an earlier description of the same
+  // Records |executablePath| and |description| for |host|. Fails with ESRCH when no process
+  // |host| exists; EINVAL for an empty identifier or version, an executable path that is not
+  // absolute, or a description that a property list cannot hold; the errno of stat when the
+  // executable cannot be found (ENOENT, ENOTDIR...); EACCES when it is not a regular file that
+  // this process may execute; else the errno of the file operation (ENAMETOOLONG when an
+  // escaped identifier or version exceeds a file name). Replaces an earlier record of the same
   // triple.
   static os::Status addService(pid_t host, const std::string& bundleIdentifier,
-                               const std::string& version, const value::Dictionary& description);
+                               const std::string& version, const std::string& executablePath,
+                               const value::Dictionary& description);
+
+  // Starts the plug-in recorded for (this process, |bundleIdentifier|, |version|): its
+  // executable, with argv[0] the executable's path and as its whole environment the string
+  // entries of the description's "ZynService" "EnvironmentVariables" (none when absent; entries
+  // that are not strings, or whose name is empty or holds '=', are skipped with a log line).
+  // Nothing else of this process is passed on (see CleanSpawn). Returns the child's pid; the
+  // caller reaps it. Fails with EPERM when this process was not made ready for the plug-in,
+  // EINVAL for an empty identifier or version or a broken record, or the errno of reading the
+  // record or of posix_spawn (ENOENT when the executable has gone since).
+  static os::Result<pid_t> start(const std::string& bundleIdentifier, const std::string& version);
 
   // Deletes the service of |bundleIdentifier| and |version| for every host. 0 when at least one
   // was removed, kNoSuchService when none existed, EINVAL for an empty identifier or version,

@@ -227,7 +227,8 @@ TEST_F(AXDatabaseTest, AnUninstallEvictsTheRecordAndWithdrawsItsServices) {
   auto plugIn = server_->findPlugIn(rgData->uuid());
   ASSERT_TRUE(plugIn);
   server_->setAnnotation(Dictionary{{"election", Value::integer(7)}}, *plugIn);
-  ASSERT_TRUE(launcher::ServiceLauncher::addService(getpid(), "gone.plugin", "1.0", {}).ok());
+  ASSERT_TRUE(
+      launcher::ServiceLauncher::addService(getpid(), "gone.plugin", "1.0", "/bin/sh", {}).ok());
   ASSERT_TRUE(server_->workspace()->unregisterPlugIn(*rgData->bundlePath()).ok());
   ASSERT_TRUE(log().waitForLog("UNINSTALLED:gone.plugin gone.plugin(1.0) " +
                                    rgData->uuid().string() + " " + *rgData->bundlePath(),

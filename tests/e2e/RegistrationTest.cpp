@@ -99,7 +99,8 @@ TEST_F(RegistrationTest, AnUninstallByAnotherProcessIsLoggedAndWithdrawsServices
   std::string second = bundle("Widgets", "widget.two");
   ASSERT_EQ(add({first, second}), "ok");
   ASSERT_TRUE(daemon().waitForLog("INSTALLED:widget.two widget.two(1.0)"));
-  ASSERT_TRUE(launcher::ServiceLauncher::addService(getpid(), "widget.one", "1.0", {}).ok());
+  ASSERT_TRUE(
+      launcher::ServiceLauncher::addService(getpid(), "widget.one", "1.0", "/bin/sh", {}).ok());
 
   ASSERT_TRUE(registry_->uninstallApplication(daemon().root() + "/Applications/Widgets.app").ok());
   ASSERT_TRUE(daemon().waitForLog("UNINSTALLED:widget.two widget.two(1.0)"));

@@ -1,9 +1,12 @@
 #include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <filesystem>
+#include <fstream>
 #include <future>
 #include <thread>
 
@@ -45,24 +48,57 @@ class ServiceLauncherTest : public ::testing::Test {
     return triples;
   }
 
+  // A plug-in stand-in. It writes to "report" beside it whether it could catch SIGUSR2 (a shell
+  // cannot trap what was ignored when it started), whether descriptor 47 is open, and its
+  // environment.
+  std::string reporter() const {
+    const std::string script =
+        root_.write("reporter", "#!/bin/sh\nexec > " + root_ / "report" +
+                                    "\ntrap 'echo USR2=caught' USR2\nkill -USR2 $$\n"
+                                    "if [ -e /proc/$$/fd/47 ]; then echo FD47=open; fi\nenv\n");
+    chmod(script.c_str(), 0755);
+    return script;
+  }
+
+  // Starts the stand-in recorded for this process and returns the lines of its report, sorted,
+  // less the working directory that the shell exports by itself.
+  std::vector<std::string> runReporter() const {
+    auto started = ServiceLauncher::start("com.x.r", "1");
+    EXPECT_TRUE(started.ok()) << started.error().message;
+    int status = -1;
+    if (started.ok()) waitpid(started.value(), &status, 0);
+    EXPECT_EQ(status, 0);
+    std::vector<std::string> lines;
+    std::ifstream report(root_ / "report");
+    for (std::string line; std::getline(report, line);) {
+      if (!line.starts_with("PWD=")) lines.push_back(line);
+    }
+    std::sort(lines.begin(), lines.end());
+    return lines;
+  }
+
   TempDirectory root_;
   ScopedEnvironment environment_;
+  const std::string executable_ = "/bin/sh";
   const Dictionary description_{
       {"ZynService", Value::dictionary({{"_SandboxProfile", Value::string("plugin")}})}};
 };
 
 TEST_F(ServiceLauncherTest, RemovalReachesEveryHostAndOnlyThatVersion) {
   for (pid_t host : {getppid(), getpid()}) {
-    ASSERT_TRUE(ServiceLauncher::addService(host, "com.x.p", "1", description_).ok());
+    ASSERT_TRUE(ServiceLauncher::addService(host, "com.x.p", "1", executable_, description_).ok());
   }
   // A second addition of one triple replaces the first.
-  ASSERT_TRUE(ServiceLauncher::addService(getpid(), "com.x.p", "2", description_).ok());
-  ASSERT_TRUE(ServiceLauncher::addService(getpid(), "com.x.p", "2", Dictionary()).ok());
+  ASSERT_TRUE(
+      ServiceLauncher::addService(getpid(), "com.x.p", "2", executable_, description_).ok());
+  ASSERT_TRUE(
+      ServiceLauncher::addService(getpid(), "com.x.p", "2", executable_, Dictionary()).ok());
   auto services = ServiceLauncher::services();
   ASSERT_TRUE(services.ok());
   ASSERT_EQ(services.value().size(), 3u);
   for (const auto& s : services.value()) {
     EXPECT_EQ(s.description, s.version == "2" ? Dictionary() : description_) << s.host;
+    EXPECT_EQ(s.executablePath, executable_);
   }
 
   EXPECT_EQ(ServiceLauncher::removeService("com.x.p", "1"), 0);
@@ -76,21 +112,29 @@ TEST_F(ServiceLauncherTest, BadRequestsFailAndWriteNothing) {
   pid_t child = fork();
   if (child == 0) _exit(0);
   ASSERT_EQ(waitpid(child, nullptr, 0), child);
+  const std::string plain = root_.write("plain", "#!/bin/sh\n");
   struct Case {
     pid_t host;
-    std::string identifier, version;
+    std::string identifier, version, executable;
     Dictionary description;
     int errnum;
   } cases[] = {
-      {child, "com.x.p", "1", description_, ESRCH},
-      {0, "com.x.p", "1", description_, ESRCH},
-      {getpid(), "", "1", description_, EINVAL},
-      {getpid(), "com.x.p", "", description_, EINVAL},
-      {getpid(), "com.x.p", "1", Dictionary{{"null", Value()}}, EINVAL},
+      {child, "com.x.p", "1", executable_, description_, ESRCH},
+      {0, "com.x.p", "1", executable_, description_, ESRCH},
+      {getpid(), "", "1", executable_, description_, EINVAL},
+      {getpid(), "com.x.p", "", executable_, description_, EINVAL},
+      {getpid(), "com.x.p", "1", executable_, Dictionary{{"null", Value()}}, EINVAL},
+      {getpid(), "com.x.p", "1", "bin/sh", description_, EINVAL},
+      {getpid(), "com.x.p", "1", root_ / "missing", description_, ENOENT},
+      {getpid(), "com.x.p", "1", plain + "/x", description_, ENOTDIR},
+      {getpid(), "com.x.p", "1", plain, description_, EACCES},
+      {getpid(), "com.x.p", "1", root_.path(), description_, EACCES},
   };
   for (const auto& c : cases) {
-    auto added = ServiceLauncher::addService(c.host, c.identifier, c.version, c.description);
-    ASSERT_FALSE(added.ok()) << c.host << " " << c.identifier << " " << c.version;
+    auto added =
+        ServiceLauncher::addService(c.host, c.identifier, c.version, c.executable, c.description);
+    ASSERT_FALSE(added.ok()) << c.host << " " << c.identifier << " " << c.version << " "
+                             << c.executable;
     EXPECT_EQ(added.error().errnum, c.errnum) << added.error().message;
   }
   EXPECT_TRUE(listed().empty());
@@ -106,7 +150,8 @@ TEST_F(ServiceLauncherTest, AnyNameRoundTripsAndStaysDistinct) {
                                                                   {".hidden", "../1"},
                                                                   {"x", std::string("1\0/", 3)}};
   for (const auto& [identifier, version] : names) {
-    ASSERT_TRUE(ServiceLauncher::addService(getpid(), identifier, version, description_).ok())
+    ASSERT_TRUE(
+        ServiceLauncher::addService(getpid(), identifier, version, executable_, description_).ok())
         << identifier;
   }
   decltype(listed()) expected;
@@ -126,7 +171,8 @@ TEST_F(ServiceLauncherTest, AnyNameRoundTripsAndStaysDistinct) {
 }
 
 TEST_F(ServiceLauncherTest, AsyncRemovalCompletesOnTheQueue) {
-  ASSERT_TRUE(ServiceLauncher::addService(getpid(), "com.x.p", "1", description_).ok());
+  ASSERT_TRUE(
+      ServiceLauncher::addService(getpid(), "com.x.p", "1", executable_, description_).ok());
   std::promise<std::pair<int, bool>> done;
   auto queue = std::make_shared<zyn::ThreadQueue>("launcher-test");
   ServiceLauncher::removeService("com.x.p", "1", queue, [&](int result) {
@@ -142,7 +188,9 @@ TEST_F(ServiceLauncherTest, RacingAddsAndRemovesLeaveWholeFiles) {
     threads.emplace_back([this, t] {
       for (int i = 0; i < 50; ++i) {
         if ((i + t) % 2 == 0) {
-          EXPECT_TRUE(ServiceLauncher::addService(getpid(), "com.x.p", "1", description_).ok());
+          EXPECT_TRUE(
+              ServiceLauncher::addService(getpid(), "com.x.p", "1", executable_, description_)
+                  .ok());
         } else {
           int result = ServiceLauncher::removeService("com.x.p", "1");
           EXPECT_TRUE(result == 0 || result == ServiceLauncher::kNoSuchService) << result;
@@ -156,6 +204,48 @@ TEST_F(ServiceLauncherTest, RacingAddsAndRemovesLeaveWholeFiles) {
   for (const auto& service : services.value()) EXPECT_EQ(service.description, description_);
   for (const auto& name : files())
     EXPECT_EQ(name, "com.x.p/1/" + std::to_string(getpid()) + ".plist");
+}
+
+TEST_F(ServiceLauncherTest, StartNeedsThisProcessMadeReadyAndTheExecutable) {
+  const std::string script = reporter();
+  auto failure = [](const std::string& identifier, const std::string& version) {
+    auto started = ServiceLauncher::start(identifier, version);
+    return started.ok() ? 0 : started.error().errnum;
+  };
+  EXPECT_EQ(failure("com.x.r", "1"), EPERM);  // no table at all
+  ASSERT_TRUE(ServiceLauncher::addService(getppid(), "com.x.r", "1", script, description_).ok());
+  ASSERT_TRUE(ServiceLauncher::addService(getpid(), "com.x.r", "2", script, description_).ok());
+  EXPECT_EQ(failure("com.x.r", "1"), EPERM);  // made ready for another process only
+  EXPECT_EQ(failure("com.x.other", "2"), EPERM);
+  EXPECT_EQ(failure(std::string(300, 'x'), "2"), EPERM);
+  EXPECT_EQ(failure("", "2"), EINVAL);
+  ASSERT_EQ(unlink(script.c_str()), 0);
+  EXPECT_EQ(failure("com.x.r", "2"), ENOENT);
+}
+
+TEST_F(ServiceLauncherTest, StartGivesThePlugInOnlyWhatItsDescriptionSays) {
+  // The host's own variable, ignored signal and open descriptor must not reach the plug-in.
+  environment_.set("AXD_HOST_ONLY", "1");
+  sighandler_t usr2 = signal(SIGUSR2, SIG_IGN);
+  ASSERT_EQ(dup2(STDERR_FILENO, 47), 47);
+  const Value variables = Value::dictionary({{"HOME", Value::string("/container")},
+                                             {"SPACED", Value::string("a b=c")},
+                                             {"EMPTY", Value::string("")},
+                                             {"NUMBER", Value::integer(1)},
+                                             {"A=B", Value::string("c")}});
+  const std::pair<Dictionary, std::vector<std::string>> cases[] = {
+      {{{"ZynService", Value::dictionary({{"EnvironmentVariables", variables}})}},
+       {"EMPTY=", "HOME=/container", "SPACED=a b=c", "USR2=caught"}},
+      {description_, {"USR2=caught"}},
+      {Dictionary(), {"USR2=caught"}},
+  };
+  for (const auto& [description, expected] : cases) {
+    ASSERT_TRUE(
+        ServiceLauncher::addService(getpid(), "com.x.r", "1", reporter(), description).ok());
+    EXPECT_EQ(runReporter(), expected) << description.size();
+  }
+  close(47);
+  signal(SIGUSR2, usr2);
 }
 
 }  // namespace

@@ -1,0 +1,26 @@
+#pragma once
+
+#include <sys/types.h>
+
+#include <string>
+#include <vector>
+
+#include "platform/os/Error.h"
+
+namespace launcher {
+
+// Starts a program as a fresh process rather than as a copy of the caller: it gets the given
+// environment and nothing else of the caller's, all signals unblocked and at their default
+// actions, and no open descriptor but standard input, output and error. Stateless; safe to call
+// from any thread.
+class CleanSpawn {
+ public:
+  // Starts |program| (an absolute path) with argv[0] |program|, no further arguments and
+  // exactly the "NAME=value" entries of |environment|. Returns the child's pid; the caller owns
+  // the child and reaps it. Fails with the errno of posix_spawn, which includes the exec's
+  // (ENOENT, EACCES, ENOEXEC...).
+  static os::Result<pid_t> run(const std::string& program,
+                               const std::vector<std::string>& environment);
+};
+
+}  // namespace launcher
