@@ -11,6 +11,9 @@ inline const std::string kManagerEntitlement = AXD_VENDOR_PREFIX ".private.annex
 inline const std::string kAutoElectEntitlement = AXD_VENDOR_PREFIX ".developer.auto-elect-plugin";
 // Plug-in entitlement: a string naming the plug-in whose annotations this one shares.
 inline const std::string kReplacePlugInEntitlement = AXD_VENDOR_PREFIX ".developer.replace-plugin";
+// Host entitlement: a match rule that limits the plug-ins the host may use.
+inline const std::string kAllowedPlugInsEntitlement =
+    AXD_VENDOR_PREFIX ".developer.annexa.allowedplugins";
 // Posted after every change of annotations or holds, so that hosts query again.
 inline const std::string kAnnotationChangeNotification =
     AXD_VENDOR_PREFIX ".annexa.annotation-change";

@@ -2,6 +2,7 @@
 
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <string_view>
 
@@ -10,6 +11,8 @@
 #include "platform/registrum/PlugInRecord.h"
 #include "platform/value/Dictionary.h"
 #include "platform/value/Value.h"
+
+class AXDZynClient;
 
 // The daemon's plug-in record: an AXPlugInCore built from the application registry's record of
 // an installed plug-in (its "rgproxy"), answering every manifest question through that record.
@@ -106,6 +109,21 @@ class AXDPlugIn : public AXPlugInCore {
   // The activation-rule evaluator's answer for |value| as the rule and |pattern| as the host's
   // items.
   bool matchDictionary(const value::Value& value, const value::Dictionary& pattern) const;
+
+  // ---- Access policy (AXDPlugInPolicy.cpp) ---------------------------------------------------
+
+  // Why |client| may not use the plug-in, or nothing when it may. Checked in order, the first
+  // refusal wins: the client's restriction entitlement "<vendor prefix>.developer.annexa.
+  // allowedplugins" must, when present, be a dictionary ("invalid host restriction
+  // entitlement") that the plug-in matches ("the host's plug-in entitlement does not allow this
+  // plug-in"); the client must have the entitlement that the plug-in's
+  // "QSExtensionHostEntitlement" names, when it names one ("the host does not have the
+  // \"<name>\" entitlement"). A "QSExtensionHostEntitlement" that is no string names nothing.
+  std::optional<std::string> allowForClient(const AXDZynClient& client) const;
+  // The consent services granted to the plug-in's containing application, read afresh from the
+  // consent store. Empty for a plug-in outside any application, and, after a log line, when the
+  // application cannot be opened or the store cannot answer for it.
+  std::set<std::string> allowedPCXServices() const;
 
   // A new dictionary with the entries of |dictionary| whose keys do not begin with "DT".
   static value::Dictionary prunedInfoDictionaryFor(const value::Dictionary& dictionary);

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "axd/AXDPlugInHold.h"
+#include "axd/AXDUserPrefs.h"
 #include "axd/AXDatabase.h"
 #include "axd/AXDatabaseDelegate.h"
 #include "platform/os/Format.h"
@@ -66,6 +67,9 @@ class AXDServer : public AXDatabase, public AXDatabaseDelegate {
   // registered" are logged from the service queue.
   void removedPlugIns(const registrum::PlugInList& plugIns) override;
 
+  // The user's settings of the plug-in framework (the exclusions that discovery applies).
+  const AXDUserPrefs& userPrefs() const { return userPrefs_; }
+
   std::uint32_t verbose() const { return verbose_.load(std::memory_order_relaxed); }
   void setVerbose(std::uint32_t verbose) { verbose_.store(verbose, std::memory_order_relaxed); }
 
@@ -81,6 +85,7 @@ class AXDServer : public AXDatabase, public AXDatabaseDelegate {
   std::shared_ptr<AXDPlugInHold> takeHold(const std::function<bool(const AXDPlugInHold&)>& matches);
 
   std::atomic<std::uint32_t> verbose_{0};
+  const AXDUserPrefs userPrefs_;
   std::shared_ptr<zyn::StrandQueue> zynQueue_;
   std::shared_ptr<zyn::ThreadQueue> mainQueue_;
   std::shared_ptr<zyn::Listener> service_;

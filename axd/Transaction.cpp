@@ -19,6 +19,7 @@ constexpr Handler kHandlers[] = {
     {AXProtocol::kAdd, &Transaction::addPlugIns},
     {AXProtocol::kRemove, &Transaction::removePlugIns},
     {AXProtocol::kBulk, &Transaction::bulkPlugIns},
+    {AXProtocol::kMatch, &Transaction::matchPlugIns},
     {AXProtocol::kAnnotate, &Transaction::annotatePlugIns},
 };
 

@@ -11,6 +11,7 @@
 #include "platform/zyn/Message.h"
 #include "platform/zyn/Reply.h"
 
+class AXDMatchList;
 class AXDPlugIn;
 class AXDServer;
 class AXDZynClient;
@@ -49,6 +50,11 @@ class Transaction {
   void removePlugIns();
   void bulkPlugIns();
   void annotatePlugIns();
+  void matchPlugIns();
+
+  // |form| with "annotations" set to |plugIn|'s annotation, or to an empty dictionary when it
+  // has none: a discovered form always carries the key.
+  value::Dictionary addAnnotationForPlugIn(const AXDPlugIn& plugIn, const value::Dictionary& form);
 
   // Called per path with the path and whether it could be resolved (the resolved path when it
   // could, the path as given when not). Returns false to stop, having sent the failure reply.
@@ -67,6 +73,26 @@ class Transaction {
   bool processUuidList(const PlugInVisitor& visitor);
 
  private:
+  // What one discovery request asks, read once at its start.
+  struct Discovery {
+    std::optional<value::Dictionary> rule;
+    std::uint64_t flags = 0;
+    bool all = false;
+    std::optional<value::Value> exclusions;
+  };
+
+  // True when the client may discover with AXDiscoverAll: it has the manager entitlement and,
+  // asked only then, runs outside any sandbox (a sandbox that cannot be asked counts as one).
+  bool mayDiscoverAll();
+  // The candidate steps for one record of a discovery: appended to |matches| when kept.
+  void considerCandidate(const AXDPlugIn& plugIn, const Discovery& discovery,
+                         AXDMatchList& matches);
+  // True when |discovery| hides |plugIn| from this client: off the system volume outside an
+  // application or with flag 0x8, dedicated to another application, or held.
+  bool hiddenFromClient(const AXDPlugIn& plugIn, const Discovery& discovery);
+  // True (logged at debug level) when |plugIn| matches one of the user's exclusion rules.
+  bool excluded(const AXDPlugIn& plugIn, const Discovery& discovery);
+
   // An integer field of the request; 0 when absent or not an unsigned integer.
   std::uint64_t integerField(const char* key) const;
   // Visits the elements of the array |key| in order until |visit| returns false. Fails with

@@ -4,11 +4,19 @@
 #include "axd/AXDServer.h"
 #include "axd/AXDZynClient.h"
 #include "axd/Transaction.h"
+#include "platform/value/PropertyList.h"
 
 namespace {
 
 constexpr const char* kElection = "election";
 constexpr const char* kExtension = "extension";
+
+// True when the annotation file can hold |value|. The wire carries values a property list cannot
+// (UUIDs, envelopes, integers above 2^63 - 1, text with NUL); storing one would leave every
+// later change of the file unsaved.
+bool storable(const value::Value& value) {
+  return value::PropertyList::toXml(value).ok();
+}
 
 }  // namespace
 
@@ -21,14 +29,14 @@ void Transaction::annotatePlugIns() {
   }
   value::Dictionary annotation;
   if (const value::Value* election = annotations->find(kElection)) {
-    if (!election->isNumber()) {
+    if (!election->isNumber() || !storable(*election)) {
       fail(AXProtocol::kMalformedRequest, "invalid request format (annotation election)");
       return;
     }
     annotation = annotation.with(kElection, *election);
   }
   if (const value::Value* extension = annotations->find(kExtension)) {
-    if (!extension->asDictionary()) {
+    if (!extension->asDictionary() || !storable(*extension)) {
       fail(AXProtocol::kMalformedRequest, "invalid request format (annotation extension)");
       return;
     }

@@ -72,6 +72,14 @@ TEST_F(AnnotationTest, AnnotateChecksEveryFieldBeforeStoringAnything) {
       client.outcome(annotate(client, {first},
                               {{"election", Value::integer(1)}, {"extension", Value::array({})}})),
       "4: invalid request format (annotation extension)");
+  // Values the wire carries but the file cannot hold are refused like wrong types.
+  EXPECT_EQ(
+      client.outcome(annotate(client, {first}, {{"election", Value::unsignedInteger(UINT64_MAX)}})),
+      "4: invalid request format (annotation election)");
+  EXPECT_EQ(client.outcome(annotate(
+                client, {first},
+                {{"extension", Value::dictionary({{"id", Value::uuid(value::Uuid::random())}})}})),
+            "4: invalid request format (annotation extension)");
   EXPECT_EQ(client.outcome(annotate(client, {}, {{"other", Value::integer(1)}})), "ok");
   EXPECT_FALSE(table());  // nothing stored, so nothing written
 

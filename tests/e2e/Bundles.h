@@ -15,6 +15,39 @@ inline void writePlist(const std::string& path, const value::Value& plist) {
   std::ofstream(path, std::ios::trunc) << value::PropertyList::toXml(plist).value();
 }
 
+// What a plug-in bundle declares beyond a well-formed minimum.
+struct PlugInContents {
+  std::string id;
+  std::string version = "1.0";
+  // "QSExtensionAttributes" of the plug-in dictionary.
+  value::Dictionary attributes;
+  // Further keys of the plug-in dictionary ("Dedicated", "QSExtensionHostEntitlement", ...).
+  value::Dictionary extension;
+  // The plug-in's Entitlements.plist; none is written when empty.
+  value::Dictionary entitlements;
+};
+
+// Writes the plug-in bundle |bundle| (a ".appex" directory) as |contents| says; returns |bundle|.
+// Where it lies decides the rest: inside "<x>.app/PlugIns" it has a containing application (which
+// the caller writes), under "<root>/System/" it is on the system volume.
+inline std::string writePlugIn(const std::string& bundle, const PlugInContents& contents) {
+  using value::Value;
+  value::Dictionary extension =
+      contents.extension.with("QSExtensionPointIdentifier", Value::string("test.point"))
+          .with("QSExtensionProtocol", Value::string("TestProtocol"))
+          .with("QSExtensionAttributes", Value::dictionary(contents.attributes));
+  writePlist(bundle + "/Info.plist",
+             Value::dictionary({
+                 {"QFBundleIdentifier", Value::string(contents.id)},
+                 {"QFBundleShortVersionString", Value::string(contents.version)},
+                 {"QSExtension", Value::dictionary(extension)},
+             }));
+  if (!contents.entitlements.empty()) {
+    writePlist(bundle + "/Entitlements.plist", Value::dictionary(contents.entitlements));
+  }
+  return bundle;
+}
+
 // "<directory>/<app>.app/PlugIns/<id>.appex": a well-formed plug-in with identifier |id|, inside
 // an application of that name; returns the plug-in's path.
 inline std::string plugIn(const std::string& directory, const std::string& app,
@@ -22,31 +55,40 @@ inline std::string plugIn(const std::string& directory, const std::string& app,
   using value::Value;
   writePlist(directory + "/" + app + ".app/Info.plist",
              Value::dictionary({{"QFBundleIdentifier", Value::string("app." + app)}}));
-  std::string bundle = directory + "/" + app + ".app/PlugIns/" + id + ".appex";
-  writePlist(bundle + "/Info.plist",
+  return writePlugIn(directory + "/" + app + ".app/PlugIns/" + id + ".appex", {.id = id});
+}
+
+// Makes |app| (a ".app" directory) an application whose executable is a copy of |program|, so
+// that the process started from the copy belongs to |app|; returns the copy's path.
+inline std::string hostApplication(const std::string& app, const std::string& program) {
+  using value::Value;
+  std::string name = std::filesystem::path(program).filename();
+  writePlist(app + "/Info.plist", Value::dictionary({
+                                      {"QFBundleIdentifier", Value::string("host." + name)},
+                                      {"QFBundleExecutable", Value::string(name)},
+                                  }));
+  std::filesystem::copy_file(program, app + "/" + name,
+                             std::filesystem::copy_options::overwrite_existing);
+  return app + "/" + name;
+}
+
+// Grants the program at |executable| |entitlements| in the entitlement table of device |root|,
+// through the table file "<name>.plist", which a later grant of the same name replaces.
+inline void grantProgram(const std::string& root, const std::string& name,
+                         const std::string& executable, const value::Dictionary& entitlements) {
+  using value::Value;
+  std::string file = root + "/etc/annexa/entitlements.d/" + name + ".plist";
+  writePlist(file,
              Value::dictionary({
-                 {"QFBundleIdentifier", Value::string(id)},
-                 {"QFBundleShortVersionString", Value::string("1.0")},
-                 {"QSExtension", Value::dictionary({
-                                     {"QSExtensionPointIdentifier", Value::string("test.point")},
-                                     {"QSExtensionProtocol", Value::string("TestProtocol")},
-                                     {"QSExtensionAttributes", Value::dictionary({})},
-                                 })},
+                 {"Executable", Value::string(std::filesystem::canonical(executable).string())},
+                 {"Entitlements", Value::dictionary(entitlements)},
              }));
-  return bundle;
+  std::filesystem::permissions(file, std::filesystem::perms(0644));
 }
 
 // Grants the running test program |entitlements| in the entitlement table of device |root|.
 inline void grantThisProgram(const std::string& root, const value::Dictionary& entitlements) {
-  using value::Value;
-  writePlist(
-      root + "/etc/annexa/entitlements.d/e2e_tests.plist",
-      Value::dictionary({
-          {"Executable", Value::string(std::filesystem::canonical("/proc/self/exe").string())},
-          {"Entitlements", Value::dictionary(entitlements)},
-      }));
-  std::filesystem::permissions(root + "/etc/annexa/entitlements.d/e2e_tests.plist",
-                               std::filesystem::perms(0644));
+  grantProgram(root, "e2e_tests", "/proc/self/exe", entitlements);
 }
 
 }  // namespace bundles

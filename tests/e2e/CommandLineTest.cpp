@@ -144,6 +144,39 @@ TEST(Axctl, WithoutADaemonFailsWithCode4) {
   EXPECT_TRUE(outcome.err.starts_with("axctl: error 4: Connection invalid")) << outcome.err;
 }
 
+TEST(Axctl, RefusesMalformedRulesFlagsAndExtensionsBeforeConnecting) {
+  TempDirectory root;
+  const std::string uuid = "12345678-1234-1234-1234-123456789ABC";
+  struct Case {
+    std::vector<std::string> arguments;
+    std::string error;  // empty: accepted, so the missing daemon is reached
+  };
+  const std::vector<Case> cases = {
+      {{"match", "--rule", "[1]"}, "--rule: not a JSON object (array)"},
+      {{"match", "{\"a\":"}, "RULE: not valid JSON"},
+      {{"match", "--rule", R"({"a":{"b":[true,null]}})"}, "null at /a/b/1"},
+      {{"match", "--rule", R"({"a":{"b":1,"b":2}})"}, "key \"b\" repeated"},
+      {{"match", "--rule", R"({"a":"x"})", "a=true"}, "key \"a\" given twice"},
+      {{"match", "=x"}, "not KEY=PATTERN"},
+      {{"match", "--flag", "newest"}, "newest not in {all,all-copies,all-versions,system-only}"},
+      {{"annotate", "--extension", "\"x\"", uuid}, "--extension: not a JSON object (string)"},
+      {{"match", "--flag", "all", "--rule", R"({"a":["x",1.5]})", R"({"b":{}})", "c=false"}, ""},
+      {{"annotate", "--election", "1", "--extension", R"({"k":[1]})", uuid}, ""},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(testing::PrintToString(c.arguments));
+    Subprocess::Outcome outcome =
+        Subprocess::run(AXCTL_EXECUTABLE, c.arguments, {{"ANNEXA_ROOT", root.path()}});
+    if (c.error.empty()) {
+      EXPECT_TRUE(outcome.err.starts_with("axctl: error 4: Connection invalid")) << outcome.err;
+      continue;
+    }
+    EXPECT_NE(outcome.status, 0);
+    EXPECT_NE(outcome.err.find(c.error), std::string::npos) << outcome.err;
+    EXPECT_EQ(outcome.err.find("axctl: error"), std::string::npos) << outcome.err;
+  }
+}
+
 TEST(Axctl, HelpNamesEveryCommand) {
   Subprocess::Outcome help = Subprocess::run(AXCTL_EXECUTABLE, {"--help"});
   EXPECT_EQ(help.status, 0);

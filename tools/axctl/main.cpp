@@ -7,6 +7,8 @@
 #include "Annexa/AXProtocol.h"
 #include "tools/axctl/Axctl.h"
 #include "tools/axctl/NotificationPrinter.h"
+#include "tools/axctl/RuleParser.h"
+#include "tools/axctl/ValueJson.h"
 
 namespace {
 
@@ -20,16 +22,40 @@ std::vector<value::Uuid> parseUuids(const std::vector<std::string>& texts) {
   return uuids;
 }
 
-// KEY=PATTERN pairs as a rule dictionary of string patterns.
-std::optional<value::Dictionary> parseRule(const std::vector<std::string>& pairs) {
-  if (pairs.empty()) return std::nullopt;
-  std::map<std::string, value::Value> rule;
-  for (const auto& pair : pairs) {
-    auto equals = pair.find('=');
-    if (equals == std::string::npos) throw CLI::ValidationError("RULE", "not KEY=PATTERN: " + pair);
-    rule[pair.substr(0, equals)] = value::Value::string(pair.substr(equals + 1));
-  }
-  return value::Dictionary(std::move(rule));
+const std::map<std::string, std::uint64_t> kDiscoveryFlags = {
+    {"all-versions", AXProtocol::kDiscoverAllVersions},
+    {"all-copies", AXProtocol::kDiscoverAllCopies},
+    {"system-only", AXProtocol::kDiscoverSystemOnly},
+    {"all", AXProtocol::AXDiscoverAll},
+};
+
+template <typename T>
+void check(const os::Result<T>& result, const std::string& what) {
+  if (!result.ok()) throw CLI::ValidationError(what, result.error().message);
+}
+
+// The rule of --rule JSON and the RULE arguments, merged; nothing when neither is given.
+std::optional<value::Dictionary> parseRule(const std::optional<std::string>& json,
+                                           const std::vector<std::string>& pieces) {
+  RuleParser parser;
+  if (json) check(parser.addJson(*json), "--rule");
+  for (const auto& piece : pieces) check(parser.add(piece), "RULE");
+  return parser.rule();
+}
+
+std::uint64_t discoveryFlags(std::uint64_t flags, const std::vector<std::string>& names) {
+  for (const auto& name : names) flags |= kDiscoveryFlags.at(name);
+  return flags;
+}
+
+value::Dictionary parseAnnotations(std::optional<std::int64_t> election,
+                                   const std::optional<std::string>& extension) {
+  value::Dictionary annotations;
+  if (election) annotations = annotations.with("election", value::Value::integer(*election));
+  if (!extension) return annotations;
+  auto dictionary = dictionaryFromJson(*extension);
+  check(dictionary, "--extension");
+  return annotations.with("extension", value::Value::dictionary(dictionary.value()));
 }
 
 }  // namespace
@@ -49,9 +75,12 @@ int main(int argc, char** argv) {
 
   std::vector<std::string> paths;
   std::vector<std::string> uuidTexts;
-  std::vector<std::string> rulePairs;
+  std::vector<std::string> rulePieces;
+  std::optional<std::string> ruleJson;
+  std::vector<std::string> flagNames;
   std::uint64_t flags = 0;
   std::optional<std::int64_t> election;
+  std::optional<std::string> extension;
   bool apps = false;
   bool bundles = false;
   std::string notification;
@@ -64,11 +93,17 @@ int main(int argc, char** argv) {
   remove->add_option("paths", paths, "absolute paths of plug-in bundles");
   auto* bulk = app.add_subcommand("bulk", "send a bulk request (its options are only logged)");
   bulk->add_option("--flags", flags, "bulk options");
-  auto* match = app.add_subcommand("match", "discover plug-ins matching KEY=PATTERN...");
-  match->add_option("rule", rulePairs, "KEY=PATTERN pairs of the match rule");
+  auto* match = app.add_subcommand("match", "discover plug-ins matching a rule");
+  match->add_option("rule", rulePieces,
+                    "KEY=PATTERN pairs (PATTERN true and false are booleans) or JSON objects "
+                    "starting with '{'; merged with --rule");
+  match->add_option("--rule", ruleJson, "the match rule as a JSON object");
   match->add_option(
       "--flags", flags,
       "discovery flags (0x1 all versions, 0x4 all copies, 0x8 system only, 0x200 all)");
+  match->add_option("--flag", flagNames, "a discovery flag by name, ORed into --flags")
+      ->check(CLI::IsMember(kDiscoveryFlags))
+      ->allow_extra_args(false);
   auto* ready = app.add_subcommand("ready", "make plug-ins launchable for this process");
   ready->add_option("uuids", uuidTexts, "plug-in UUIDs")->required();
   ready->add_option("--flags", flags, "ready flags");
@@ -78,6 +113,8 @@ int main(int argc, char** argv) {
   auto* annotate = app.add_subcommand("annotate", "record the user's election of plug-ins");
   annotate->add_option("uuids", uuidTexts, "plug-in UUIDs")->required();
   annotate->add_option("--election", election, "the election to store");
+  annotate->add_option("--extension", extension,
+                       "the annotation's \"extension\" dictionary, as a JSON object");
   auto* hold = app.add_subcommand("hold", "hold plug-ins out of use; prints the hold's token");
   hold->add_option("paths", paths, "application or plug-in bundle paths")->required();
   auto* holdKind = hold->add_option_group("kind");
@@ -104,13 +141,13 @@ int main(int argc, char** argv) {
     if (*add) return axctl.add(paths);
     if (*remove) return axctl.remove(paths);
     if (*bulk) return axctl.bulk(flags);
-    if (*match) return axctl.match(parseRule(rulePairs), flags);
+    if (*match) {
+      return axctl.match(parseRule(ruleJson, rulePieces), discoveryFlags(flags, flagNames));
+    }
     if (*ready) return axctl.ready(parseUuids(uuidTexts), flags);
     if (*access) return axctl.access(parseUuids(uuidTexts), flags);
     if (*annotate) {
-      value::Dictionary annotations;
-      if (election) annotations = annotations.with("election", value::Value::integer(*election));
-      return axctl.annotate(parseUuids(uuidTexts), annotations);
+      return axctl.annotate(parseUuids(uuidTexts), parseAnnotations(election, extension));
     }
     if (*hold) {
       if (apps) flags = AXProtocol::kHoldApplications;

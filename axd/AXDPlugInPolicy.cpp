@@ -1,0 +1,57 @@
+// The access policy of a plug-in record: which hosts may use it, and which consent services its
+// application was granted.
+
+#include "Annexa/AXBundle.h"
+#include "axd/AXDNames.h"
+#include "axd/AXDPlugIn.h"
+#include "axd/AXDZynClient.h"
+#include "platform/consent/ConsentStore.h"
+#include "platform/os/Format.h"
+#include "platform/os/Log.h"
+
+namespace {
+
+constexpr int kLogNotice = 5;
+
+void logNotice(std::string_view format, std::initializer_list<os::FormatArg> arguments) {
+  os::Log::write(kLogNotice, os::format(format, arguments));
+}
+
+}  // namespace
+
+std::optional<std::string> AXDPlugIn::allowForClient(const AXDZynClient& client) const {
+  if (auto restriction = client.entitlementValueForKey(AXDNames::kAllowedPlugInsEntitlement)) {
+    const value::Dictionary* rule = restriction->asDictionary();
+    if (!rule) return "invalid host restriction entitlement";
+    if (!match(*rule)) return "the host's plug-in entitlement does not allow this plug-in";
+  }
+  std::optional<value::Value> demanded = pluginKey("QSExtensionHostEntitlement");
+  const std::string* name = demanded ? demanded->asString() : nullptr;
+  if (name && !client.hasEntitlement(*name)) {
+    return os::format("the host does not have the \"%@\" entitlement", {*name});
+  }
+  return std::nullopt;
+}
+
+std::set<std::string> AXDPlugIn::allowedPCXServices() const {
+  std::set<std::string> granted;
+  std::optional<AXFileURL> containing = containingUrl();
+  if (!containing) return granted;
+  // A fresh bundle object reads Info.plist anew, so there is no cached information to drop.
+  std::shared_ptr<AXBundle> bundle = AXBundle::initWithURL(*containing);
+  if (!bundle->path()) {
+    logNotice("failed to create bundle for %@", {path()});
+    return granted;
+  }
+  std::optional<std::string> identifier = bundle->bundleIdentifier();
+  auto entries =
+      identifier ? consent::ConsentStore::informationForBundle(*identifier) : std::nullopt;
+  if (!entries) {
+    logNotice("PCXAccessCopyInformationForBundle failed for %@", {bundle->bundle()->description()});
+    return granted;
+  }
+  for (const consent::ConsentStore::Entry& entry : *entries) {
+    if (entry.granted == true) granted.insert(entry.service);
+  }
+  return granted;
+}

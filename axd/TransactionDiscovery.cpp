@@ -1,0 +1,102 @@
+// The discovery request: match.
+
+#include "Annexa/AXDaemonClient.h"
+#include "Annexa/AXProtocol.h"
+#include "axd/AXDMatchList.h"
+#include "axd/AXDNames.h"
+#include "axd/AXDServer.h"
+#include "axd/AXDZynClient.h"
+#include "axd/Transaction.h"
+#include "platform/os/Probes.h"
+#include "platform/sandbox/Sandbox.h"
+
+void Transaction::matchPlugIns() {
+  Discovery discovery;
+  if (const value::Value* rules = request_.find(AXProtocol::kRules)) {
+    if (!rules->asDictionary()) {
+      fail(AXProtocol::kMalformedRequest, "invalid request format (bad rules dictionary)");
+      return;
+    }
+    discovery.rule = *rules->asDictionary();
+  }
+  discovery.flags = integerField(AXProtocol::kFlags);
+  discovery.all = discovery.flags & AXProtocol::AXDiscoverAll;
+  if (discovery.all && !mayDiscoverAll()) {
+    fail(AXProtocol::kNotEntitled, "unauthorized discovery flag (AXDiscoverAll)");
+    return;
+  }
+  AXDMatchList matches(discovery.flags);
+  discovery.exclusions = server()->userPrefs().exclusions();
+  // A registry that cannot answer leaves nothing to discover; findPlugIns has logged why.
+  AXDatabase::PlugIns candidates =
+      server()->findPlugIns(discovery.rule).value_or(AXDatabase::PlugIns{});
+  os::Probes::discoverRaw(static_cast<unsigned>(candidates.size()));
+  for (const auto& plugIn : candidates) considerCandidate(*plugIn, discovery, matches);
+  std::optional<value::Value> list =
+      AXDaemonClient::convertToZyn(value::Value::array(matches.finish()), version_);
+  if (list) reply_.set(AXProtocol::kMatches, *list);
+  done();
+}
+
+bool Transaction::mayDiscoverAll() {
+  if (!client_->hasEntitlement(AXDNames::kManagerEntitlement)) return false;
+  os::Result<bool> sandboxed = sandbox::Sandbox::isSandboxed(client_->pid());
+  if (!sandboxed.ok()) {
+    server()->debug("client %d: cannot tell whether it is sandboxed: %@",
+                    {client_->pid(), sandboxed.error().message});
+    return false;
+  }
+  return !sandboxed.value();
+}
+
+void Transaction::considerCandidate(const AXDPlugIn& plugIn, const Discovery& discovery,
+                                    AXDMatchList& matches) {
+  if (!discovery.all && hiddenFromClient(plugIn, discovery)) return;
+  if (!plugIn.match(discovery.rule)) return;
+  if (excluded(plugIn, discovery)) return;
+  if (!discovery.all) {
+    if (std::optional<std::string> refusal = plugIn.allowForClient(*client_)) {
+      server()->debug("client %d cannot use plugin %@: %@",
+                      {client_->pid(), plugIn.identifier().value_or("(null)"), *refusal});
+      return;
+    }
+  }
+  // Exporting cannot fail, so the cheaper deduplication goes first.
+  if (!matches.admit(plugIn)) return;
+  value::Dictionary form = addAnnotationForPlugIn(plugIn, plugIn.exportForm());
+  matches.append(plugIn.augmentForm(form), plugIn);
+}
+
+bool Transaction::hiddenFromClient(const AXDPlugIn& plugIn, const Discovery& discovery) {
+  if (!plugIn.onSystemVolume()) {
+    if (!plugIn.containingUrl()) return true;
+    if (discovery.flags & AXProtocol::kDiscoverSystemOnly) return true;
+  }
+  if (plugIn.isDedicated()) {
+    const std::shared_ptr<AXBundle>& bundle = client_->bundle();
+    std::optional<std::string> plugIns = bundle ? bundle->plugInsPath() : std::nullopt;
+    if (!plugIns || !plugIn.path().starts_with(*plugIns + "/")) return true;
+  }
+  return server()->holdOnPlugIn(plugIn);
+}
+
+bool Transaction::excluded(const AXDPlugIn& plugIn, const Discovery& discovery) {
+  const value::Array* rules = discovery.exclusions ? discovery.exclusions->asArray() : nullptr;
+  if (!rules) return false;
+  for (const value::Value& rule : *rules) {
+    // A rule that is no dictionary names nothing to exclude.
+    const value::Dictionary* entries = rule.asDictionary();
+    if (!entries || !plugIn.match(*entries)) continue;
+    server()->debug("client %d plugin %@ excluded",
+                    {client_->pid(), plugIn.identifier().value_or("(null)")});
+    return true;
+  }
+  return false;
+}
+
+value::Dictionary Transaction::addAnnotationForPlugIn(const AXDPlugIn& plugIn,
+                                                      const value::Dictionary& form) {
+  std::optional<value::Dictionary> annotation = server()->annotationForPlugIn(plugIn);
+  return form.with("annotations",
+                   value::Value::dictionary(annotation.value_or(value::Dictionary())));
+}

@@ -1,0 +1,178 @@
+// The plug-in record's decisions that need the running server: the election its rules read, the
+// access policy toward a real client, and the consent services of its application.
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+#include <set>
+#include <string>
+
+#include "axd/AXDNames.h"
+#include "platform/os/Paths.h"
+#include "platform/value/PropertyList.h"
+#include "tests/axd/InProcessServer.h"
+#include "tests/axd/SelfClient.h"
+#include "tests/plugin/RegistryRecords.h"
+
+namespace {
+
+using namespace records;
+using registrum::PlugInRecord;
+using value::Dictionary;
+using value::Value;
+
+class AXDPlugInPolicyTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    server_ = InProcessServer::shared().built();
+    ASSERT_TRUE(server_);
+    since_ = InProcessServer::shared().logSize();
+  }
+  void TearDown() override {
+    std::filesystem::remove(grantFile());
+    std::filesystem::remove(consentFile());
+  }
+
+  static std::string root() { return InProcessServer::shared().root(); }
+  // Sorts before the other tests' table files, so its grants win while it exists.
+  static std::string grantFile() { return root() + "/etc/annexa/entitlements.d/0-policy.plist"; }
+  static std::string consentFile() { return root() + "/var/db/consent.plist"; }
+
+  static void writePlist(const std::string& path, const Value& plist) {
+    std::filesystem::create_directories(std::filesystem::path(path).parent_path());
+    std::ofstream(path, std::ios::trunc) << value::PropertyList::toXml(plist).value();
+    std::filesystem::permissions(path, std::filesystem::perms(0644));
+  }
+
+  // A plug-in |identifier| in the application |app| under the root (the system volume when
+  // |app| is empty), demanding the host entitlement |demanded| when given.
+  static std::shared_ptr<AXDPlugIn> record(const std::string& identifier,
+                                           std::optional<Value> demanded = std::nullopt,
+                                           const std::string& app = "Apps/Policy.app") {
+    std::string appPath = root() + "/" + app;
+    PlugInRecord::Fields fields = plugIn(app.empty() ? root() + "/System/Library/Tool.appex"
+                                                     : appPath + "/PlugIns/Tool.appex");
+    if (!app.empty()) fields.containingApplication = application(appPath);
+    fields.plugInIdentifier = identifier;
+    if (demanded) {
+      fields.plugInDictionary =
+          fields.plugInDictionary.with("QSExtensionHostEntitlement", *demanded);
+    }
+    auto built = build(std::move(fields));
+    EXPECT_TRUE(built);
+    return built;
+  }
+
+  // The reason a client of this program granted |entitlements| is refused |plugIn|; "" when
+  // allowed.
+  static std::string refusal(const Dictionary& entitlements, const AXDPlugIn& plugIn) {
+    writePlist(grantFile(), Value::dictionary({
+                                {"Executable", S(os::Paths::canonical("/proc/self/exe").value())},
+                                {"Entitlements", Value::dictionary(entitlements)},
+                            }));
+    SelfClient self;
+    if (!self.client() || !self.client()->task()) return "no client";
+    return plugIn.allowForClient(*self.client()).value_or("");
+  }
+
+  std::shared_ptr<AXDServer> server_;
+  std::size_t since_ = 0;
+};
+
+TEST_F(AXDPlugInPolicyTest, TheElectionIsMatchedWithoutItsSecondByte) {
+  const struct {
+    std::optional<std::int64_t> stored;
+    const char* text;
+  } cases[] = {{std::nullopt, "0"}, {1, "1"}, {257, "1"}, {256, "0"}, {65537, "65537"}};
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.text);
+    auto plugIn = record("policy.election." + std::to_string(c.stored.value_or(-1)));
+    if (c.stored)
+      server_->setAnnotation(Dictionary{{"election", Value::integer(*c.stored)}}, *plugIn);
+    EXPECT_TRUE(plugIn->matchKey("QSUserElection", S(c.text)));
+    EXPECT_TRUE(plugIn->match(Dictionary{{"QSUserElection", A({S("7"), S(c.text)})}}));
+    EXPECT_FALSE(plugIn->matchKey("QSUserElection", S(std::string("9") + c.text)));
+  }
+}
+
+TEST_F(AXDPlugInPolicyTest, TheFirstRefusalWins) {
+  const std::string restricted = "the host's plug-in entitlement does not allow this plug-in";
+  const std::string invalid = "invalid host restriction entitlement";
+  const std::string noX = "the host does not have the \"x\" entitlement";
+  const Value onlyABC = D({{"QSExtensionIdentifier", S("a.b.c")}});
+  const std::string& allowedPlugIns = AXDNames::kAllowedPlugInsEntitlement;
+  const struct {
+    Dictionary entitlements;
+    std::string identifier;
+    std::optional<Value> demanded;
+    std::string expected;
+  } cases[] = {
+      {{{allowedPlugIns, onlyABC}}, "a.b.c", std::nullopt, ""},
+      {{{allowedPlugIns, onlyABC}}, "a.b.cd", std::nullopt, restricted},
+      {{{allowedPlugIns, onlyABC}}, "A.B.C", std::nullopt, restricted},
+      {{{allowedPlugIns, onlyABC}}, "a.b.d", S("x"), restricted},
+      {{{allowedPlugIns, onlyABC}}, "a.b.c", S("x"), noX},
+      {{{allowedPlugIns, S("a.b.c")}}, "a.b.c", std::nullopt, invalid},
+      {{{allowedPlugIns, A({onlyABC})}}, "a.b.c", std::nullopt, invalid},
+      {{{allowedPlugIns, D({})}}, "a.b.e", std::nullopt, ""},
+      {{}, "a.b.f", std::nullopt, ""},
+      {{}, "a.b.g", S("x"), noX},
+      {{{"x", Value::boolean(false)}}, "a.b.g", S("x"), noX},
+      {{{"x", Value::integer(0)}}, "a.b.g", S("x"), noX},
+      {{{"x", Value::boolean(true)}}, "a.b.g", S("x"), ""},
+      {{{"x", S("")}}, "a.b.g", S("x"), ""},
+      {{}, "a.b.h", Value::boolean(true), ""},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(Value::dictionary(c.entitlements).description() + " " + c.identifier);
+    EXPECT_EQ(refusal(c.entitlements, *record(c.identifier, c.demanded)), c.expected);
+  }
+}
+
+TEST_F(AXDPlugInPolicyTest, ConsentServicesAreTheGrantedOnesOfTheApplication) {
+  writePlist(root() + "/Apps/Consent.app/Info.plist",
+             Value::dictionary({{"QFBundleIdentifier", S("com.example.consent")}}));
+  auto plugIn = record("policy.consent", std::nullopt, "Apps/Consent.app");
+  auto entry = [](const char* service, std::optional<bool> granted) {
+    Dictionary fields{{"Service", S(service)}};
+    return Value::dictionary(granted ? fields.with("Granted", Value::boolean(*granted)) : fields);
+  };
+  EXPECT_EQ(plugIn->allowedPCXServices(), std::set<std::string>{});
+  writePlist(
+      consentFile(),
+      D({{"com.example.consent", A({entry("network", true), entry("camera", false),
+                                    entry("microphone", std::nullopt), entry("photos", true)})},
+         {"com.example.other", A({entry("location", true)})}}));
+  EXPECT_EQ(plugIn->allowedPCXServices(), (std::set<std::string>{"network", "photos"}));
+  EXPECT_EQ(record("policy.system", std::nullopt, "")->allowedPCXServices(),
+            std::set<std::string>{});
+  // Read afresh at every call.
+  writePlist(consentFile(), D({{"com.example.consent", A({entry("camera", true)})}}));
+  EXPECT_EQ(plugIn->allowedPCXServices(), std::set<std::string>{"camera"});
+}
+
+TEST_F(AXDPlugInPolicyTest, AnUnreadableApplicationOrStoreGrantsNothing) {
+  writePlist(root() + "/Apps/Anonymous.app/Info.plist", D({}));
+  writePlist(root() + "/Apps/Broken.app/Info.plist",
+             Value::dictionary({{"QFBundleIdentifier", S("com.example.broken")}}));
+  writePlist(consentFile(), D({{"com.example.broken", S("network")}}));
+  auto missing = record("policy.missing", std::nullopt, "Apps/Missing.app");
+  EXPECT_TRUE(missing->allowedPCXServices().empty());
+  EXPECT_TRUE(
+      record("policy.anonymous", std::nullopt, "Apps/Anonymous.app")->allowedPCXServices().empty());
+  EXPECT_TRUE(
+      record("policy.broken", std::nullopt, "Apps/Broken.app")->allowedPCXServices().empty());
+  auto& log = InProcessServer::shared();
+  EXPECT_TRUE(log.waitForLog("failed to create bundle for " + missing->path(), since_));
+  EXPECT_TRUE(log.waitForLog("PCXAccessCopyInformationForBundle failed for", since_));
+  auto lines = log.logLines(since_);
+  EXPECT_EQ(std::count_if(lines.begin(), lines.end(),
+                          [](const std::string& line) {
+                            return line.starts_with("PCXAccessCopyInformationForBundle failed for");
+                          }),
+            2);
+}
+
+}  // namespace

@@ -1,0 +1,180 @@
+// One discovery request's match list: which records of one identifier it keeps, in what order,
+// and the override links between the kept forms.
+
+#include <gtest/gtest.h>
+
+#include <string>
+#include <vector>
+
+#include "Annexa/AXProtocol.h"
+#include "axd/AXDMatchList.h"
+#include "axd/AXDNames.h"
+#include "tests/platform/ScopedEnvironment.h"
+#include "tests/plugin/RegistryRecords.h"
+
+namespace {
+
+using namespace records;
+using registrum::PlugInRecord;
+using value::Value;
+
+constexpr std::uint64_t kVersions = AXProtocol::kDiscoverAllVersions;
+constexpr std::uint64_t kCopies = AXProtocol::kDiscoverAllCopies;
+
+struct Copy {
+  std::string identifier = "t";
+  std::optional<std::string> version = "1.9";
+  bool system = false;
+  double modified = 0;
+  std::optional<Value> replaces;
+};
+
+class AXDMatchListTest : public ::testing::Test {
+ protected:
+  void SetUp() override { environment_.unset("ANNEXA_ROOT"); }
+
+  // A record on the system volume, or in an application, with the facts of |copy|.
+  static std::shared_ptr<AXDPlugIn> record(const Copy& copy) {
+    PlugInRecord::Fields fields =
+        plugIn(copy.system ? "/System/Library/" + copy.identifier + ".appex"
+                           : "/Apps/Host.app/PlugIns/Tool.appex");
+    if (!copy.system) fields.containingApplication = application("/Apps/Host.app");
+    fields.plugInIdentifier = copy.identifier;
+    fields.onSystemPartition = copy.system;
+    fields.registrationDate = copy.modified;
+    value::Dictionary attributes;
+    if (copy.version) attributes = {{"QSExtensionVersion", S(*copy.version)}};
+    fields.plugInDictionary =
+        fields.plugInDictionary.with("QSExtensionAttributes", Value::dictionary(attributes));
+    if (copy.replaces) {
+      fields.entitlements = {{AXDNames::kReplacePlugInEntitlement, *copy.replaces}};
+    }
+    auto built = build(std::move(fields));
+    EXPECT_TRUE(built);
+    return built;
+  }
+
+  // The forms that a request with |flags| keeps of |copies|, offered in order; each form is
+  // labelled with the index of its copy.
+  static value::Array discover(std::uint64_t flags, const std::vector<Copy>& copies) {
+    AXDMatchList list(flags);
+    for (std::size_t i = 0; i < copies.size(); ++i) {
+      auto plugIn = record(copies[i]);
+      if (list.admit(*plugIn)) {
+        list.append(
+            plugIn->exportForm().with("label", Value::integer(static_cast<std::int64_t>(i))),
+            *plugIn);
+      }
+    }
+    return list.finish();
+  }
+
+  static std::vector<std::int64_t> labels(const value::Array& forms) {
+    std::vector<std::int64_t> kept;
+    for (const Value& form : forms) kept.push_back(*form.asDictionary()->find("label")->asInt());
+    return kept;
+  }
+
+  ScopedEnvironment environment_;
+};
+
+using Labels = std::vector<std::int64_t>;
+
+TEST_F(AXDMatchListTest, FlagsDecideWhichVersionsAndCopiesStay) {
+  const Labels first{0}, second{1}, both{0, 1};
+  const struct {
+    std::uint64_t flags;
+    const char* version;  // of the second, later-modified copy; the first has 1.9
+    Labels expected;
+  } cases[] = {
+      {0, "1.8", first},
+      {0, "1.9", second},
+      {0, "1.10", second},
+      {kCopies, "1.8", first},
+      {kCopies, "1.9", second},
+      {kCopies, "1.10", second},
+      {kVersions, "1.8", both},
+      {kVersions, "1.9", second},
+      {kVersions, "1.10", both},
+      {kVersions | kCopies, "1.8", both},
+      {kVersions | kCopies, "1.9", both},
+      {kVersions | kCopies, "1.10", both},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(std::to_string(c.flags) + " " + c.version);
+    EXPECT_EQ(labels(discover(c.flags, {{}, {.version = c.version, .modified = 1}})), c.expected);
+  }
+  // Other identifiers, even in another case, and a missing version, which is the lowest.
+  EXPECT_EQ(labels(discover(0, {{}, {.identifier = "T"}})), both);
+  EXPECT_EQ(labels(discover(0, {{.version = std::nullopt}, {.version = "0"}})), second);
+  EXPECT_EQ(labels(discover(0, {{.version = "0"}, {.version = std::nullopt}})), first);
+}
+
+TEST_F(AXDMatchListTest, CopiesOfOneVersionPreferTheSystemThenTheLaterTime) {
+  const struct {
+    Copy first, second;
+    Labels expected;
+  } cases[] = {
+      {{.modified = 5}, {.system = true, .modified = 1}, {1}},
+      {{.system = true, .modified = 1}, {.modified = 5}, {1}},
+      {{.system = true, .modified = 5}, {.modified = 1}, {0}},
+      {{.system = true, .modified = 1}, {.modified = 1}, {0}},
+      {{.system = true, .modified = 1}, {.system = true, .modified = 5}, {1}},
+      {{.system = true, .modified = 5}, {.system = true, .modified = 5}, {0}},
+      {{.modified = 1}, {.modified = 1}, {0}},
+      {{.modified = -5}, {.modified = -1}, {1}},
+      {{.modified = -1}, {.modified = -5}, {0}},
+  };
+  for (std::size_t i = 0; i < std::size(cases); ++i) {
+    EXPECT_EQ(labels(discover(0, {cases[i].first, cases[i].second})), cases[i].expected)
+        << "case " << i;
+    EXPECT_EQ(labels(discover(kVersions, {cases[i].first, cases[i].second})), cases[i].expected)
+        << "case " << i;
+  }
+}
+
+TEST_F(AXDMatchListTest, AReplacementGoesToTheEndAndTheReplacedLeavesItsPlace) {
+  EXPECT_EQ(labels(discover(0, {{.identifier = "a"},
+                                {.identifier = "b"},
+                                {.identifier = "c"},
+                                {.identifier = "a", .version = "2"}})),
+            (Labels{1, 2, 3}));
+  // The walk passes other versions to reach the copy of the same version.
+  EXPECT_EQ(labels(discover(kVersions, {{.version = "1"},
+                                        {.version = "2"},
+                                        {.identifier = "b"},
+                                        {.version = "2", .modified = 1},
+                                        {.version = "2"}})),
+            (Labels{0, 2, 3}));
+}
+
+TEST_F(AXDMatchListTest, OverridesLinkTheReplacedAndTheReplacing) {
+  value::Array forms =
+      discover(0, {
+                      {.identifier = "a"},
+                      {.identifier = "b"},
+                      {.identifier = "c"},
+                      {.identifier = "r1", .replaces = S("a")},
+                      {.identifier = "r2", .replaces = A({S("b"), Value::integer(1), S("c")})},
+                      {.identifier = "r3", .replaces = S("a")},
+                      {.identifier = "r4", .replaces = Value::integer(1)},
+                      {.identifier = "r5", .replaces = S("absent")},
+                  });
+  ASSERT_EQ(forms.size(), 8u);
+  auto field = [&](std::size_t i, const char* key) {
+    const Value* found = forms[i].asDictionary()->find(key);
+    return found ? found->description() : "none";
+  };
+  auto uuidOf = [&](std::size_t i) { return field(i, "uuid"); };
+  EXPECT_EQ(field(0, "overrider"), uuidOf(5));  // the later claim on "a" wins
+  EXPECT_EQ(field(1, "overrider"), uuidOf(4));
+  EXPECT_EQ(field(2, "overrider"), uuidOf(4));
+  EXPECT_EQ(field(5, "overriding"), S("a").description());
+  EXPECT_NE(field(4, "overriding"), "none");
+  for (std::size_t i : {3u, 6u, 7u}) {
+    EXPECT_EQ(field(i, "overriding"), "none") << i;
+    EXPECT_EQ(field(i, "overrider"), "none") << i;
+  }
+}
+
+}  // namespace
