@@ -22,12 +22,16 @@ std::int64_t integerField(const value::Dictionary& form, const char* key) {
 }  // namespace
 
 bool AXDMatchList::admit(const AXDPlugIn& plugIn) {
-  std::string identifier = plugIn.identifier().value_or("");
-  for (auto it = forms_.begin(); it != forms_.end(); ++it) {
-    if (textField(**it, "identifier") != identifier) continue;
-    std::optional<bool> replaces = decide(plugIn, **it);
+  auto group = byIdentifier_.find(plugIn.identifier().value_or(""));
+  if (group == byIdentifier_.end()) return true;
+  std::vector<Kept>& kept = group->second;
+  for (auto it = kept.begin(); it != kept.end(); ++it) {
+    std::optional<bool> replaces = decide(plugIn, *it->form);
     if (!replaces) continue;
-    if (*replaces) forms_.erase(it);
+    if (*replaces) {
+      forms_[it->position] = nullptr;
+      kept.erase(it);
+    }
     return *replaces;
   }
   return true;
@@ -56,6 +60,7 @@ bool AXDMatchList::prefersNew(const AXDPlugIn& plugIn, const value::Dictionary& 
 
 void AXDMatchList::append(value::Dictionary form, const AXDPlugIn& plugIn) {
   Form kept = std::make_shared<value::Dictionary>(std::move(form));
+  byIdentifier_[plugIn.identifier().value_or("")].push_back({kept, forms_.size()});
   forms_.push_back(kept);
   std::optional<value::Value> replaced =
       plugIn.valueForEntitlement(AXDNames::kReplacePlugInEntitlement);
@@ -70,6 +75,7 @@ void AXDMatchList::append(value::Dictionary form, const AXDPlugIn& plugIn) {
 
 value::Array AXDMatchList::finish() {
   for (const Form& form : forms_) {
+    if (!form) continue;
     std::string identifier = textField(*form, "identifier");
     auto entry = overrides_.find(identifier);
     if (entry == overrides_.end()) continue;
@@ -78,6 +84,8 @@ value::Array AXDMatchList::finish() {
     *replacing = replacing->with("overriding", value::Value::string(identifier));
   }
   value::Array kept;
-  for (const Form& form : forms_) kept.push_back(value::Value::dictionary(*form));
+  for (const Form& form : forms_) {
+    if (form) kept.push_back(value::Value::dictionary(*form));
+  }
   return kept;
 }

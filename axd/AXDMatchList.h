@@ -4,6 +4,7 @@
 #include <map>
 #include <memory>
 #include <string>
+#include <unordered_map>
 #include <vector>
 
 #include "platform/value/Value.h"
@@ -41,6 +42,11 @@ class AXDMatchList {
 
  private:
   using Form = std::shared_ptr<value::Dictionary>;
+  // A kept form and its place in forms_.
+  struct Kept {
+    Form form;
+    std::size_t position;
+  };
 
   // The copy preference between the new record and the kept form |existing| of one version.
   static bool prefersNew(const AXDPlugIn& plugIn, const value::Dictionary& existing);
@@ -49,6 +55,10 @@ class AXDMatchList {
   std::optional<bool> decide(const AXDPlugIn& plugIn, const value::Dictionary& existing) const;
 
   const std::uint64_t flags_;
+  // Every form in the order it was kept; a removed form leaves a null behind.
   std::vector<Form> forms_;
+  // The kept forms of each identifier, in the order of forms_: the walk for a new record visits
+  // only its own identifier's forms, so a request costs linear time, not quadratic.
+  std::unordered_map<std::string, std::vector<Kept>> byIdentifier_;
   std::map<std::string, Form> overrides_;
 };

@@ -5,13 +5,13 @@
 #include <benchmark/benchmark.h>
 
 #include <cstdio>
-#include <future>
 #include <memory>
 #include <vector>
 
 #include "Annexa/AXDaemonClient.h"
 #include "bench/BulkFrames.h"
 #include "bench/EchoServer.h"
+#include "bench/SyncRoundTrip.h"
 #include "tests/support/DaemonProcess.h"
 
 namespace {
@@ -46,32 +46,10 @@ void RawSocketRoundTrip(benchmark::State& state) {
   }
 }
 
-bool succeeded(const zyn::ReplyOrError& reply) {
-  try {
-    return !AXDaemonClient::errorInReply(reply);
-  } catch (const AXInternalInconsistency&) {
-    return false;
-  }
-}
-
-// Sends one bulk request and waits for its reply on this thread, as a host calling the daemon
-// synchronously would. A future wakes the caller with one futex call, as a blocking read would.
-bool bulkRoundTrip(AXDaemonClient& client) {
-  auto reply = std::make_shared<std::promise<bool>>();
-  std::future<bool> arrived = reply->get_future();
-  client.bulkPlugins(kBulkFlags,
-                     [reply](const zyn::ReplyOrError& body) { reply->set_value(succeeded(body)); });
-  try {
-    return arrived.get();
-  } catch (const std::future_error&) {
-    return false;  // the handler was dropped unanswered
-  }
-}
-
 void DaemonBulkRoundTrip(benchmark::State& state) {
   AXDaemonClient& client = *gPeers->clients[clientIndex(state)];
   for (auto _ : state) {
-    if (!bulkRoundTrip(client)) {
+    if (!SyncRoundTrip::bulk(client, kBulkFlags)) {
       state.SkipWithError("the bulk request failed");
       break;
     }

@@ -17,7 +17,8 @@ os::Result<std::unique_ptr<Database>> Database::open(const std::string& path) {
   std::unique_ptr<Database> database(new Database(db));
   sqlite3_busy_timeout(db, kBusyTimeoutMs);
   os::Status pragmas = database->execute(
-      "PRAGMA journal_mode=WAL; PRAGMA synchronous=NORMAL; PRAGMA foreign_keys=ON;");
+      "PRAGMA journal_mode=WAL; PRAGMA synchronous=NORMAL; PRAGMA foreign_keys=ON; "
+      "PRAGMA mmap_size=268435456;");
   if (!pragmas.ok()) return pragmas.error();
   return database;
 }

@@ -75,17 +75,17 @@ os::Result<std::vector<std::shared_ptr<const ApplicationRecord>>> Store::applica
 }
 
 os::Result<PlugInList> Store::plugIns(const Selection& selection) {
-  // Unset parameters are NULL and admit every row.
+  // Only the criteria that are set become terms: SQLite plans a statement before it sees the
+  // parameters, so a term like "?1 IS NULL OR ..." would keep it from using the indexes.
+  std::string where = "WHERE 1 ";
+  if (selection.plugInIdentifier) where += "AND p.plugin_identifier = ?1 ";
+  if (selection.rulePoint) where += "AND (p.rule_point = ?2 OR p.rule_point IS NULL) ";
+  if (selection.excludePlaceholders) where += "AND (a.placeholder IS NULL OR a.placeholder = 0) ";
   os::Result<Statement> select =
-      db_->prepare(std::string(kPlugInSelect) +
-                   "WHERE (?1 IS NULL OR p.plugin_identifier = ?1) "
-                   "AND (?2 IS NULL OR p.rule_point = ?2 OR p.rule_point IS NULL) "
-                   "AND (?3 = 0 OR a.placeholder IS NULL OR a.placeholder = 0) ORDER BY p.path");
+      db_->prepare(std::string(kPlugInSelect) + where + "ORDER BY p.path");
   if (!select.ok()) return select.error();
-  select.value()
-      .bind(1, selection.plugInIdentifier)
-      .bind(2, selection.rulePoint)
-      .bind(3, std::int64_t{selection.excludePlaceholders});
+  if (selection.plugInIdentifier) select.value().bind(1, *selection.plugInIdentifier);
+  if (selection.rulePoint) select.value().bind(2, *selection.rulePoint);
   return plugInRows(select.value());
 }
 
