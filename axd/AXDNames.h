@@ -14,6 +14,14 @@ inline const std::string kReplacePlugInEntitlement = AXD_VENDOR_PREFIX ".develop
 // Host entitlement: a match rule that limits the plug-ins the host may use.
 inline const std::string kAllowedPlugInsEntitlement =
     AXD_VENDOR_PREFIX ".developer.annexa.allowedplugins";
+// Extension points whose plug-ins run under sandbox profiles of their own.
+inline const std::string kKeyboardServicePoint = AXD_VENDOR_PREFIX ".keyboard-service";
+inline const std::string kNetworkFilterPoint = AXD_VENDOR_PREFIX ".netfence.filter-data";
+inline const std::string kGlancePreviewPoint = AXD_VENDOR_PREFIX ".glance.extension.preview";
+// The consent service that lets a keyboard with open access reach the network.
+inline const std::string kKeyboardNetworkService = AXD_VENDOR_PREFIX ".consent.keyboard-network";
+// The key of a busy answer: the bundle identifier of the busy instance.
+inline const std::string kBusyBundleIdentifierKey = "ExtensionBundleIdentifier";
 // Posted after every change of annotations or holds, so that hosts query again.
 inline const std::string kAnnotationChangeNotification =
     AXD_VENDOR_PREFIX ".annexa.annotation-change";

@@ -125,6 +125,23 @@ class AXDPlugIn : public AXPlugInCore {
   // application cannot be opened or the store cannot answer for it.
   std::set<std::string> allowedPCXServices() const;
 
+  // ---- Enabling for a host (AXDPlugInEnabling.cpp) -------------------------------------------
+
+  // Registers the plug-in with the service launcher as an external service of host process
+  // |pid|, under a description built afresh: the environment (the data container's "HOME",
+  // "QFFIXED_USER_HOME" and "TMPDIR", the daemon's "AXTEST_SDK", then the manifest's
+  // "ZynService" "EnvironmentVariables"), the sandbox profile, and the manifest's "ZynService".
+  // An error of code 4 when the bundle has no executable (nothing registered) or the launcher
+  // refuses (logged with its error number).
+  std::optional<AXError> enableForPid(pid_t pid) const;
+  // The busy answer, {"ExtensionBundleIdentifier": <bundle identifier>}, when a process of the
+  // plug-in's bundle runs; nothing when none does. Without a bundle identifier each running
+  // instance is logged as incomplete and none counts.
+  std::optional<value::Dictionary> checkBusy() const;
+  // The sandbox profile the plug-in runs under: "plugin", "keyboard", "network-filter" or
+  // "glanced", by its extension point.
+  std::string sandboxProfile() const;
+
   // A new dictionary with the entries of |dictionary| whose keys do not begin with "DT".
   static value::Dictionary prunedInfoDictionaryFor(const value::Dictionary& dictionary);
 

@@ -20,7 +20,10 @@ constexpr Handler kHandlers[] = {
     {AXProtocol::kRemove, &Transaction::removePlugIns},
     {AXProtocol::kBulk, &Transaction::bulkPlugIns},
     {AXProtocol::kMatch, &Transaction::matchPlugIns},
+    {AXProtocol::kReady, &Transaction::readyPlugIns},
+    {AXProtocol::kAccess, &Transaction::accessPlugIns},
     {AXProtocol::kAnnotate, &Transaction::annotatePlugIns},
+    {AXProtocol::kLock, &Transaction::lockDownPlugIns},
 };
 
 }  // namespace

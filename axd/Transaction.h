@@ -5,6 +5,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "Annexa/AXError.h"
 #include "platform/value/Value.h"
@@ -51,6 +52,9 @@ class Transaction {
   void bulkPlugIns();
   void annotatePlugIns();
   void matchPlugIns();
+  void readyPlugIns();
+  void accessPlugIns();
+  void lockDownPlugIns();
 
   // |form| with "annotations" set to |plugIn|'s annotation, or to an empty dictionary when it
   // has none: a discovered form always carries the key.
@@ -92,6 +96,13 @@ class Transaction {
   bool hiddenFromClient(const AXDPlugIn& plugIn, const Discovery& discovery);
   // True (logged at debug level) when |plugIn| matches one of the user's exclusion rules.
   bool excluded(const AXDPlugIn& plugIn, const Discovery& discovery);
+
+  // Why the client may not have |plugIn| made ready (logged at debug level), or nothing: a hold
+  // ("the plug-in is on hold"), then, except for a data plug-in, the access policy.
+  std::optional<std::string> readyRefusal(const AXDPlugIn& plugIn);
+  // Hold mode of the lock request: the plug-ins |flags| name at each path, or nothing when a
+  // path fails (the failure sent).
+  std::optional<std::vector<std::shared_ptr<AXDPlugIn>>> plugInsToHold(std::uint64_t flags);
 
   // An integer field of the request; 0 when absent or not an unsigned integer.
   std::uint64_t integerField(const char* key) const;

@@ -25,23 +25,33 @@ struct PlugInContents {
   value::Dictionary extension;
   // The plug-in's Entitlements.plist; none is written when empty.
   value::Dictionary entitlements;
+  // Further keys of Info.plist ("ZynService", "QFBundleExecutable", ...).
+  value::Dictionary info;
+  // A program copied into the bundle and named as its executable; none when empty.
+  std::string executable;
 };
 
 // Writes the plug-in bundle |bundle| (a ".appex" directory) as |contents| says; returns |bundle|.
+// "extension" entries win over the default extension point and protocol.
 // Where it lies decides the rest: inside "<x>.app/PlugIns" it has a containing application (which
 // the caller writes), under "<root>/System/" it is on the system volume.
 inline std::string writePlugIn(const std::string& bundle, const PlugInContents& contents) {
   using value::Value;
-  value::Dictionary extension =
-      contents.extension.with("QSExtensionPointIdentifier", Value::string("test.point"))
-          .with("QSExtensionProtocol", Value::string("TestProtocol"))
-          .with("QSExtensionAttributes", Value::dictionary(contents.attributes));
-  writePlist(bundle + "/Info.plist",
-             Value::dictionary({
-                 {"QFBundleIdentifier", Value::string(contents.id)},
-                 {"QFBundleShortVersionString", Value::string(contents.version)},
-                 {"QSExtension", Value::dictionary(extension)},
-             }));
+  value::Dictionary extension{{"QSExtensionPointIdentifier", Value::string("test.point")},
+                              {"QSExtensionProtocol", Value::string("TestProtocol")}};
+  for (const auto& [key, entry] : contents.extension) extension = extension.with(key, entry);
+  extension = extension.with("QSExtensionAttributes", Value::dictionary(contents.attributes));
+  value::Dictionary info = contents.info.with("QFBundleIdentifier", Value::string(contents.id))
+                               .with("QFBundleShortVersionString", Value::string(contents.version))
+                               .with("QSExtension", Value::dictionary(extension));
+  if (!contents.executable.empty()) {
+    std::string name = std::filesystem::path(contents.executable).filename();
+    std::filesystem::create_directories(bundle);
+    std::filesystem::copy_file(contents.executable, bundle + "/" + name,
+                               std::filesystem::copy_options::overwrite_existing);
+    info = info.with("QFBundleExecutable", Value::string(name));
+  }
+  writePlist(bundle + "/Info.plist", Value::dictionary(info));
   if (!contents.entitlements.empty()) {
     writePlist(bundle + "/Entitlements.plist", Value::dictionary(contents.entitlements));
   }

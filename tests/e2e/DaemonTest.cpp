@@ -6,12 +6,15 @@
 
 #include "tests/support/BlockingClient.h"
 
-bool DaemonTest::start(const std::vector<std::string>& arguments, const std::string& serviceName) {
+bool DaemonTest::start(const std::vector<std::string>& arguments, const std::string& serviceName,
+                       const std::map<std::string, std::string>& environment) {
   // The old daemon puts ANNEXA_ROOT back when it goes, so it must go before the new one sets it.
   daemon_.reset();
   serviceName_ = serviceName;
-  DaemonProcess::Options options{
-      .arguments = arguments, .serviceName = serviceName, .captureLog = true};
+  DaemonProcess::Options options{.arguments = arguments,
+                                 .serviceName = serviceName,
+                                 .captureLog = true,
+                                 .environment = environment};
   auto started = DaemonProcess::start(AXD_EXECUTABLE, options);
   if (!started.ok()) {
     ADD_FAILURE() << "axd did not start: " << started.error().message;

@@ -4,6 +4,7 @@
 
 #include <cstddef>
 #include <initializer_list>
+#include <map>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -18,10 +19,11 @@
 // process's ANNEXA_ROOT while the daemon runs.
 class DaemonTest : public ::testing::Test {
  protected:
-  // Starts axd with |arguments|, listening on |serviceName| (the default service when empty);
-  // a daemon this test started before is stopped first. False, with the reason recorded as a
-  // test failure, when the daemon does not come up.
-  bool start(const std::vector<std::string>& arguments = {}, const std::string& serviceName = "");
+  // Starts axd with |arguments| and |environment| set over this process's, listening on
+  // |serviceName| (the default service when empty); a daemon this test started before is stopped
+  // first. False, with the reason recorded as a test failure, when the daemon does not come up.
+  bool start(const std::vector<std::string>& arguments = {}, const std::string& serviceName = "",
+             const std::map<std::string, std::string>& environment = {});
   DaemonProcess& daemon() { return *daemon_; }
 
   // Expects the daemon still to run and to answer a fresh client's bulk request.

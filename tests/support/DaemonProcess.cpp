@@ -13,6 +13,7 @@
 #include <filesystem>
 #include <fstream>
 #include <sstream>
+#include <string_view>
 #include <thread>
 
 #include "Annexa/AXDaemonClient.h"
@@ -95,8 +96,11 @@ os::Status DaemonProcess::spawn(const std::string& executable) {
   argv.push_back(nullptr);
   std::vector<std::string> settings;
   for (char** variable = environ; *variable; ++variable) {
-    if (std::strncmp(*variable, "AXD_LOG=", 8) != 0) settings.emplace_back(*variable);
+    std::string_view setting(*variable);
+    std::string name(setting.substr(0, setting.find('=')));
+    if (name != "AXD_LOG" && !options_.environment.contains(name)) settings.emplace_back(setting);
   }
+  for (const auto& [name, value] : options_.environment) settings.push_back(name + "=" + value);
   posix_spawn_file_actions_t actions;
   posix_spawn_file_actions_init(&actions);
   if (options_.captureLog) {

@@ -3,6 +3,7 @@
 #include <sys/types.h>
 
 #include <chrono>
+#include <map>
 #include <memory>
 #include <optional>
 #include <string>
@@ -22,6 +23,8 @@ class DaemonProcess {
     std::string serviceName;
     // Sets AXD_LOG=stderr and sends standard error to log(). Off, the daemon's log is dropped.
     bool captureLog = false;
+    // Variables set in the daemon's environment over those it inherits from this process.
+    std::map<std::string, std::string> environment;
   };
 
   // Starts |executable| and waits up to |timeout| until its service socket accepts

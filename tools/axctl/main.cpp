@@ -8,6 +8,7 @@
 #include "tools/axctl/Axctl.h"
 #include "tools/axctl/NotificationPrinter.h"
 #include "tools/axctl/RuleParser.h"
+#include "tools/axctl/ServiceTable.h"
 #include "tools/axctl/ValueJson.h"
 
 namespace {
@@ -85,6 +86,7 @@ int main(int argc, char** argv) {
   bool bundles = false;
   std::string notification;
   std::optional<unsigned> count;
+  bool noWait = false;
 
   auto* add = app.add_subcommand("add", "register the plug-in bundles at PATH...");
   add->add_option("paths", paths, "absolute paths of plug-in bundles");
@@ -115,7 +117,10 @@ int main(int argc, char** argv) {
   annotate->add_option("--election", election, "the election to store");
   annotate->add_option("--extension", extension,
                        "the annotation's \"extension\" dictionary, as a JSON object");
-  auto* hold = app.add_subcommand("hold", "hold plug-ins out of use; prints the hold's token");
+  auto* hold = app.add_subcommand(
+      "hold",
+      "hold plug-ins out of use: prints the hold's token and keeps the hold until SIGINT or "
+      "SIGTERM (the daemon releases it when axctl ends)");
   hold->add_option("paths", paths, "application or plug-in bundle paths")->required();
   auto* holdKind = hold->add_option_group("kind");
   holdKind->add_flag("--apps", apps,
@@ -125,6 +130,16 @@ int main(int argc, char** argv) {
   holdKind->require_option(1);
   auto* release = app.add_subcommand("release", "release the hold with token UUID");
   release->add_option("uuids", uuidTexts, "the hold's token")->required()->expected(1);
+  auto* launch = app.add_subcommand(
+      "launch",
+      "start plug-in UUID in this process (discovery, ready, start), print its pid and wait "
+      "for it");
+  launch->add_option("uuid", uuidTexts, "the plug-in's UUID")->required()->expected(1);
+  launch->add_flag("--no-wait", noWait, "exit with status 0 once the plug-in is started");
+  auto* services = app.add_subcommand(
+      "services",
+      "print the service launcher's table: which process may start which plug-in; no daemon "
+      "needed");
   auto* watch = app.add_subcommand(
       "watch",
       "print a line (NAME and local time) per post of notification NAME; no daemon needed");
@@ -135,8 +150,14 @@ int main(int argc, char** argv) {
 
   CLI11_PARSE(app, argc, argv);
   if (*watch) return NotificationPrinter::watch(notification, count);
+  if (*services) return ServiceTable::print(options.json);
 
   try {
+    // Before the client connects: a malformed UUID reaches no daemon.
+    const std::vector<value::Uuid> uuids = parseUuids(uuidTexts);
+    // A hold lives as long as its client: blocked before the client's threads start, the
+    // signals that end the hold reach only the wait in Axctl::hold.
+    if (*hold) Axctl::blockEndingSignals();
     Axctl axctl(options);
     if (*add) return axctl.add(paths);
     if (*remove) return axctl.remove(paths);
@@ -144,17 +165,18 @@ int main(int argc, char** argv) {
     if (*match) {
       return axctl.match(parseRule(ruleJson, rulePieces), discoveryFlags(flags, flagNames));
     }
-    if (*ready) return axctl.ready(parseUuids(uuidTexts), flags);
-    if (*access) return axctl.access(parseUuids(uuidTexts), flags);
+    if (*ready) return axctl.ready(uuids, flags);
+    if (*access) return axctl.access(uuids, flags);
     if (*annotate) {
-      return axctl.annotate(parseUuids(uuidTexts), parseAnnotations(election, extension));
+      return axctl.annotate(uuids, parseAnnotations(election, extension));
     }
     if (*hold) {
       if (apps) flags = AXProtocol::kHoldApplications;
       if (bundles) flags = AXProtocol::kHoldPlugIns;
       return axctl.hold(paths, flags);
     }
-    return axctl.release(parseUuids(uuidTexts).front());
+    if (*launch) return axctl.launch(uuids.front(), !noWait);
+    return axctl.release(uuids.front());
   } catch (const CLI::Error& e) {
     return app.exit(e);
   }

@@ -1,0 +1,124 @@
+// Enabling a plug-in for a host process: its service description and the launcher, and the
+// busy check of its running instances.
+
+#include <cstdlib>
+
+#include "Annexa/AXBundle.h"
+#include "axd/AXDNames.h"
+#include "axd/AXDPlugIn.h"
+#include "platform/launcher/BusyInstances.h"
+#include "platform/launcher/ServiceLauncher.h"
+#include "platform/os/Format.h"
+#include "platform/os/Log.h"
+
+namespace {
+
+constexpr std::int64_t kEnableFailed = 4;
+
+void logNotice(std::string_view format, std::initializer_list<os::FormatArg> arguments) {
+  os::Log::write(5, os::format(format, arguments));
+}
+
+bool isTrue(const std::optional<value::Value>& v) {
+  if (!v) return false;
+  if (auto flag = v->asBool()) return *flag;
+  return v->integerValue() == std::optional<std::int64_t>(1);
+}
+
+bool isPoint(const std::optional<value::Value>& point, const std::string& name) {
+  return point && point->asString() && *point->asString() == name;
+}
+
+// The manifest's "ZynService" when it is a dictionary; empty otherwise.
+value::Dictionary manifestService(const AXDPlugIn& plugIn) {
+  std::optional<value::Value> service = plugIn.infoKey("ZynService");
+  const value::Dictionary* entries = service ? service->asDictionary() : nullptr;
+  return entries ? *entries : value::Dictionary();
+}
+
+// The entries of |overrides| written over |base|. Our dictionaries are immutable values, so a
+// merge is a series of copies; the manifests hold a handful of variables.
+value::Dictionary overlay(value::Dictionary base, const value::Dictionary& overrides) {
+  for (const auto& [key, entry] : overrides) base = base.with(key, entry);
+  return base;
+}
+
+}  // namespace
+
+std::string AXDPlugIn::sandboxProfile() const {
+  std::optional<value::Value> point = pluginKey("QSExtensionPointIdentifier");
+  if (isPoint(point, AXDNames::kKeyboardServicePoint)) {
+    bool network = isTrue(attribute("RequestsOpenAccess")) &&
+                   allowedPCXServices().contains(AXDNames::kKeyboardNetworkService);
+    return network ? "plugin" : "keyboard";
+  }
+  if (isPoint(point, AXDNames::kNetworkFilterPoint)) return "network-filter";
+  std::optional<value::Dictionary> own = plugInDictionary();
+  const value::Value* ownPoint = own ? own->find("QSExtensionPointIdentifier") : nullptr;
+  if (ownPoint && isPoint(*ownPoint, AXDNames::kGlancePreviewPoint)) return "glanced";
+  return "plugin";
+}
+
+std::optional<AXError> AXDPlugIn::enableForPid(pid_t pid) const {
+  std::string id = identifier().value_or("(null)");
+  std::string version = this->version().value_or("(null)");
+  std::string uuidText = uuid() ? uuid()->string() : "(null)";
+  value::Dictionary environment;
+  if (const auto& container = rgproxy_->dataContainerPath()) {
+    environment = environment.with("HOME", value::Value::string(*container))
+                      .with("QFFIXED_USER_HOME", value::Value::string(*container))
+                      .with("TMPDIR", value::Value::string(*container + "/tmp"));
+  } else {
+    logNotice("no data container for plug-in %@(%@) %@ at %@", {id, version, uuidText, path()});
+  }
+  std::string profile = sandboxProfile();
+  if (const char* sdk = std::getenv("AXTEST_SDK")) {
+    environment = environment.with("AXTEST_SDK", value::Value::string(sdk));
+  }
+  value::Dictionary service = manifestService(*this);
+  if (const value::Value* own = service.find("EnvironmentVariables")) {
+    // Anything but a dictionary of variables adds none.
+    if (const value::Dictionary* variables = own->asDictionary()) {
+      environment = overlay(environment, *variables);
+    }
+  }
+  service = service.with("EnvironmentVariables", value::Value::dictionary(environment))
+                .with("_SandboxProfile", value::Value::string(profile))
+                .with("_OmitSandboxParameters", value::Value::boolean(true));
+  logNotice("assigning plug-in %@(%@) to %s sandbox", {id, version, profile.c_str()});
+  value::Dictionary description{{"ZynService", value::Value::dictionary(service)},
+                                {"QFBundlePackageType", value::Value::string("ZYN!")}};
+  logNotice("enabling pid=%d for plug-in %@(%@) %@ %@", {pid, id, version, uuidText, path()});
+
+  std::optional<std::string> executable;
+  if (std::optional<AXFileURL> location = url()) {
+    executable = AXBundle::initWithURL(*location)->bundle()->executablePath();
+  }
+  if (!executable) {
+    return AXMakeErrorWithFormat(kEnableFailed, "cannot obtain executable path for plug-in %@(%@)",
+                                 {id, uuidText});
+  }
+  os::Status added = launcher::ServiceLauncher::addService(
+      pid, rgproxy_->bundleIdentifier().value_or(""), rgproxy_->bundleVersion().value_or(""),
+      *executable, description);
+  if (added.ok()) return std::nullopt;
+  logNotice("zyn error %d allowing pid %d to use plug-in %@(%@) %@ at %@",
+            {added.error().errnum, pid, id, version, uuidText, path()});
+  return AXMakeErrorWithFormat(kEnableFailed, "unable to enable plug-in %@(%@) for pid %d",
+                               {id, uuidText, pid});
+}
+
+std::optional<value::Dictionary> AXDPlugIn::checkBusy() const {
+  std::vector<launcher::BusyInstances::Instance> running = launcher::BusyInstances::find(path());
+  if (running.empty()) return std::nullopt;
+  std::optional<value::Value> bundleIdentifier = infoKey("QFBundleIdentifier");
+  if (const std::string* text = bundleIdentifier ? bundleIdentifier->asString() : nullptr) {
+    return value::Dictionary{{AXDNames::kBusyBundleIdentifierKey, value::Value::string(*text)}};
+  }
+  // Every instance is one of this bundle, so none can name a bundle identifier.
+  for (std::size_t i = 0; i < running.size(); ++i) {
+    logNotice("vigild reported incomplete bundle for plug-in %@",
+              {identifier().value_or("(null)")});
+  }
+  return std::nullopt;
+}
