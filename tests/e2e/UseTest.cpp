@@ -8,11 +8,13 @@
 
 #include <algorithm>
 #include <filesystem>
+#include <fstream>
 #include <map>
 #include <set>
 #include <string>
 #include <vector>
 
+#include "Annexa/AXPlugInLauncher.h"
 #include "Annexa/AXProtocol.h"
 #include "platform/launcher/ServiceLauncher.h"
 #include "platform/registrum/Workspace.h"
@@ -367,6 +369,46 @@ TEST_F(UseTest, HoldRequestsNamingNoPlugInFailOrHoldNothing) {
   EXPECT_EQ(lock(3, {}).rfind("ok {", 0), 0u);
   EXPECT_EQ(visible(), std::set<std::string>{"lock.plain"});
   expectServing();
+}
+
+TEST_F(UseTest, APlugInMadeReadyStartsWithTheDescribedEnvironmentAndOnlyThen) {
+  boot();
+  Dictionary zyn{{"EnvironmentVariables", Value::dictionary({{"LANG", Value::string("C")}})}};
+  std::string path = install("Launch", {.id = "launch.env",
+                                        .info = {{"QFBundleExecutable", Value::string("report")},
+                                                 {"ZynService", Value::dictionary(zyn)}}});
+  {
+    std::ofstream script(path + "/report");
+    script << "#!/bin/sh\nenv > \"$HOME/env.out\"\n";
+  }
+  std::filesystem::permissions(path + "/report", std::filesystem::perms(0755));
+  Dictionary form{{"bundleInfo", Value::dictionary({
+                                     {"QFBundleIdentifier", Value::string("launch.env")},
+                                     {"QFBundleShortVersionString", Value::string("1.0")},
+                                 })}};
+  setenv("AXTEST_HOST_ONLY", "1", 1);
+
+  os::Result<pid_t> refused = AXPlugInLauncher::launch(form);
+  ASSERT_FALSE(refused.ok());
+  EXPECT_EQ(refused.error().errnum, EPERM);
+
+  ASSERT_EQ(send(AXProtocol::kReady, {uuid(path)}), "ok");
+  os::Result<pid_t> started = AXPlugInLauncher::launch(form);
+  ASSERT_TRUE(started.ok()) << started.error().message;
+  int status = 0;
+  ASSERT_EQ(waitpid(started.value(), &status, 0), started.value());
+  EXPECT_EQ(status, 0);
+
+  std::string container = record(path)->dataContainerPath().value();
+  std::ifstream written(container + "/env.out");
+  std::set<std::string> lines;
+  for (std::string line; std::getline(written, line);) lines.insert(line);
+  for (const std::string& expected : {"HOME=" + container, "QFFIXED_USER_HOME=" + container,
+                                      "TMPDIR=" + container + "/tmp", std::string("LANG=C")}) {
+    EXPECT_TRUE(lines.contains(expected)) << expected;
+  }
+  for (const std::string& line : lines) EXPECT_FALSE(line.starts_with("AXTEST_HOST_ONLY=")) << line;
+  unsetenv("AXTEST_HOST_ONLY");
 }
 
 }  // namespace
