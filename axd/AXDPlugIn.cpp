@@ -17,10 +17,6 @@ using Scope = registrum::PlugInRecord::Scope;
 
 constexpr std::int64_t kMisconfiguredCode = 12;
 
-void logNotice(std::string_view format, std::initializer_list<os::FormatArg> arguments) {
-  os::Log::write(5, os::format(format, arguments));
-}
-
 // Whole seconds since 1970, the fraction dropped; clamped to the field's 32 bits.
 std::int32_t wholeSeconds(double seconds) {
   if (std::isnan(seconds)) return 0;
@@ -82,7 +78,8 @@ std::shared_ptr<AXDPlugIn> AXDPlugIn::initWithRGData(
     record->setContainingUrl(AXFileURL(application->path()));
   }
   if (std::optional<AXError> error = record->diagnose()) {
-    logNotice("ignoring mis-configured plug-in at %@: %@", {url.path(), error->description()});
+    os::Log::notice("ignoring mis-configured plug-in at %@: %@",
+                    {url.path(), error->description()});
     return nullptr;
   }
   return record;
@@ -193,8 +190,8 @@ value::Dictionary AXDPlugIn::issueResourceExtensions(const value::Value& resourc
       extensions[*name] = value::Value::string(token.value());
       continue;
     }
-    logNotice("failed to make extension for %@ in plug-in at %@: %s",
-              {target.path(), path(), std::strerror(token.error().errnum)});
+    os::Log::notice("failed to make extension for %@ in plug-in at %@: %s",
+                    {target.path(), path(), std::strerror(token.error().errnum)});
   }
   return value::Dictionary(std::move(extensions));
 }

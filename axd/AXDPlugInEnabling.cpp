@@ -15,10 +15,6 @@ namespace {
 
 constexpr std::int64_t kEnableFailed = 4;
 
-void logNotice(std::string_view format, std::initializer_list<os::FormatArg> arguments) {
-  os::Log::write(5, os::format(format, arguments));
-}
-
 bool isTrue(const std::optional<value::Value>& v) {
   if (!v) return false;
   if (auto flag = v->asBool()) return *flag;
@@ -69,7 +65,8 @@ std::optional<AXError> AXDPlugIn::enableForPid(pid_t pid) const {
                       .with("QFFIXED_USER_HOME", value::Value::string(*container))
                       .with("TMPDIR", value::Value::string(*container + "/tmp"));
   } else {
-    logNotice("no data container for plug-in %@(%@) %@ at %@", {id, version, uuidText, path()});
+    os::Log::notice("no data container for plug-in %@(%@) %@ at %@",
+                    {id, version, uuidText, path()});
   }
   std::string profile = sandboxProfile();
   if (const char* sdk = std::getenv("AXTEST_SDK")) {
@@ -85,10 +82,10 @@ std::optional<AXError> AXDPlugIn::enableForPid(pid_t pid) const {
   service = service.with("EnvironmentVariables", value::Value::dictionary(environment))
                 .with("_SandboxProfile", value::Value::string(profile))
                 .with("_OmitSandboxParameters", value::Value::boolean(true));
-  logNotice("assigning plug-in %@(%@) to %s sandbox", {id, version, profile.c_str()});
+  os::Log::notice("assigning plug-in %@(%@) to %s sandbox", {id, version, profile.c_str()});
   value::Dictionary description{{"ZynService", value::Value::dictionary(service)},
                                 {"QFBundlePackageType", value::Value::string("ZYN!")}};
-  logNotice("enabling pid=%d for plug-in %@(%@) %@ %@", {pid, id, version, uuidText, path()});
+  os::Log::notice("enabling pid=%d for plug-in %@(%@) %@ %@", {pid, id, version, uuidText, path()});
 
   std::optional<std::string> executable;
   if (std::optional<AXFileURL> location = url()) {
@@ -102,8 +99,8 @@ std::optional<AXError> AXDPlugIn::enableForPid(pid_t pid) const {
       pid, rgproxy_->bundleIdentifier().value_or(""), rgproxy_->bundleVersion().value_or(""),
       *executable, description);
   if (added.ok()) return std::nullopt;
-  logNotice("zyn error %d allowing pid %d to use plug-in %@(%@) %@ at %@",
-            {added.error().errnum, pid, id, version, uuidText, path()});
+  os::Log::notice("zyn error %d allowing pid %d to use plug-in %@(%@) %@ at %@",
+                  {added.error().errnum, pid, id, version, uuidText, path()});
   return AXMakeErrorWithFormat(kEnableFailed, "unable to enable plug-in %@(%@) for pid %d",
                                {id, uuidText, pid});
 }
@@ -117,8 +114,8 @@ std::optional<value::Dictionary> AXDPlugIn::checkBusy() const {
   }
   // Every instance is one of this bundle, so none can name a bundle identifier.
   for (std::size_t i = 0; i < running.size(); ++i) {
-    logNotice("vigild reported incomplete bundle for plug-in %@",
-              {identifier().value_or("(null)")});
+    os::Log::notice("vigild reported incomplete bundle for plug-in %@",
+                    {identifier().value_or("(null)")});
   }
   return std::nullopt;
 }

@@ -114,7 +114,7 @@ bool AXDPlugIn::matchValuePattern(const std::string& value, const std::string& p
     return types::TypeRegistry::conforms(std::string(text.substr(kIs.size())), value);
   }
   if (text.starts_with("?")) {
-    os::Log::write(5, os::format("unrecognized match operator:%@", {pattern}));
+    os::Log::notice("unrecognized match operator:%@", {pattern});
     return false;
   }
   for (const Operator& op : kOperators) {

@@ -9,16 +9,6 @@
 #include "platform/os/Format.h"
 #include "platform/os/Log.h"
 
-namespace {
-
-constexpr int kLogNotice = 5;
-
-void logNotice(std::string_view format, std::initializer_list<os::FormatArg> arguments) {
-  os::Log::write(kLogNotice, os::format(format, arguments));
-}
-
-}  // namespace
-
 std::optional<std::string> AXDPlugIn::allowForClient(const AXDZynClient& client) const {
   if (auto restriction = client.entitlementValueForKey(AXDNames::kAllowedPlugInsEntitlement)) {
     const value::Dictionary* rule = restriction->asDictionary();
@@ -40,14 +30,15 @@ std::set<std::string> AXDPlugIn::allowedPCXServices() const {
   // A fresh bundle object reads Info.plist anew, so there is no cached information to drop.
   std::shared_ptr<AXBundle> bundle = AXBundle::initWithURL(*containing);
   if (!bundle->path()) {
-    logNotice("failed to create bundle for %@", {path()});
+    os::Log::notice("failed to create bundle for %@", {path()});
     return granted;
   }
   std::optional<std::string> identifier = bundle->bundleIdentifier();
   auto entries =
       identifier ? consent::ConsentStore::informationForBundle(*identifier) : std::nullopt;
   if (!entries) {
-    logNotice("PCXAccessCopyInformationForBundle failed for %@", {bundle->bundle()->description()});
+    os::Log::notice("PCXAccessCopyInformationForBundle failed for %@",
+                    {bundle->bundle()->description()});
     return granted;
   }
   for (const consent::ConsentStore::Entry& entry : *entries) {

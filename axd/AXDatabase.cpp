@@ -16,10 +16,6 @@ constexpr const char* kSource = "axd/AXDatabase";
 // The line the registry consistency failure names, kept stable for whoever searches the logs.
 constexpr int kContainingBundleLine = 168;
 
-void log(std::string_view format, std::initializer_list<os::FormatArg> arguments) {
-  os::Log::write(5, os::format(format, arguments));
-}
-
 std::string text(const std::optional<std::string>& value) {
   return value.value_or("(null)");
 }
@@ -29,14 +25,14 @@ std::string text(const std::optional<std::string>& value) {
 bool AXDatabase::initWithDatabase(const char* path) {
   auto workspace = registrum::Workspace::defaultWorkspace();
   if (!workspace.ok()) {
-    log("unable to open the application registry: %@", {workspace.error().message});
+    os::Log::notice("unable to open the application registry: %@", {workspace.error().message});
     return false;
   }
   workspace_ = workspace.value();
   annotations_ = std::make_unique<AXDAnnotationStore>(path);
   os::Status observed = workspace_->addObserver(shared_from_this());
   if (!observed.ok()) {
-    log("unable to observe the application registry: %@", {observed.error().message});
+    os::Log::notice("unable to observe the application registry: %@", {observed.error().message});
     return false;
   }
   return true;
@@ -64,7 +60,7 @@ std::shared_ptr<AXDPlugIn> AXDatabase::createPlugInForProxy(
 
 void AXDatabase::purgeCachesToLimit(std::uint32_t limit) {
   if (cache_.size() <= limit) return;
-  log("purging cache for %d > %d", {cache_.size(), limit});
+  os::Log::notice("purging cache for %d > %d", {cache_.size(), limit});
   cache_.clear();
   workspace_->clearCaches();
 }
@@ -75,7 +71,7 @@ std::shared_ptr<AXDPlugIn> AXDatabase::findPlugIn(const value::Uuid& uuid) {
     if (cached != cache_.end()) return cached->second;
     auto rgData = workspace_->plugInForUuid(uuid);
     if (rgData.ok() && rgData.value()) return createPlugInForProxy(rgData.value());
-    log("Registrum cannot find plug-in with UUID:%@", {uuid.string()});
+    os::Log::notice("Registrum cannot find plug-in with UUID:%@", {uuid.string()});
     return nullptr;
   });
 }
@@ -83,7 +79,7 @@ std::shared_ptr<AXDPlugIn> AXDatabase::findPlugIn(const value::Uuid& uuid) {
 std::shared_ptr<AXDPlugIn> AXDatabase::findPlugInAtPath(const std::string& path) {
   auto rgData = workspace_->plugInAtPath(path);
   if (!rgData.ok() || !rgData.value()) {
-    log("Registrum cannot find plug-in at path:%@", {path});
+    os::Log::notice("Registrum cannot find plug-in at path:%@", {path});
     return nullptr;
   }
   return findPlugIn(rgData.value()->uuid());
@@ -106,7 +102,7 @@ std::optional<AXDatabase::PlugIns> AXDatabase::findPlugIns(
   auto candidates = (!rule || rule->empty()) ? workspace_->listPlugIns()
                                              : workspace_->query(*rule, electionFilter(*rule));
   if (!candidates.ok()) {
-    log("Registrum query failed: %@", {candidates.error().message});
+    os::Log::notice("Registrum query failed: %@", {candidates.error().message});
     return std::nullopt;
   }
   PlugIns plugIns;
@@ -126,7 +122,8 @@ bool AXDatabase::isQueryCandidate(const registrum::PlugInRecord& candidate) {
   if (!application->path().ends_with(".app")) {
     // A registry row another process corrupted must not stop the daemon for every client:
     // the record is left out and the failure logged as the internal inconsistency it is.
-    log("internal inconsistency in %@:%d: RG reported containingBundle is not an application "
+    os::Log::notice(
+        "internal inconsistency in %@:%d: RG reported containingBundle is not an application "
         "(skipping plug-in at %@)",
         {kSource, kContainingBundleLine, *candidate.bundlePath()});
     return false;
@@ -184,7 +181,8 @@ void AXDatabase::autoElect(const AXDPlugIn& plugIn) {
 
 void AXDatabase::pluginsDidInstall(const registrum::PlugInList& plugIns) {
   for (const auto& record : plugIns) {
-    log("INSTALLED:%@ %@(%@) %@ %@",
+    os::Log::notice(
+        "INSTALLED:%@ %@(%@) %@ %@",
         {text(record->bundleIdentifier()), text(record->plugInIdentifier()),
          text(record->bundleVersion()), record->uuid().string(), text(record->bundlePath())});
   }
@@ -193,7 +191,8 @@ void AXDatabase::pluginsDidInstall(const registrum::PlugInList& plugIns) {
 void AXDatabase::pluginsWillUninstall(const registrum::PlugInList& plugIns) {
   _sync.sync([&] {
     for (const auto& record : plugIns) {
-      log("UNINSTALLED:%@ %@(%@) %@ %@",
+      os::Log::notice(
+          "UNINSTALLED:%@ %@(%@) %@ %@",
           {text(record->bundleIdentifier()), text(record->plugInIdentifier()),
            text(record->bundleVersion()), record->uuid().string(), text(record->bundlePath())});
       cache_.erase(record->uuid());
@@ -209,6 +208,7 @@ std::size_t AXDatabase::cachedCount() {
 void AXDatabase::postAnnotationChange() {
   os::Status posted = notify::Notification::post(AXDNames::kAnnotationChangeNotification);
   if (!posted.ok()) {
-    log("unable to post %@: %@", {AXDNames::kAnnotationChangeNotification, posted.error().message});
+    os::Log::notice("unable to post %@: %@",
+                    {AXDNames::kAnnotationChangeNotification, posted.error().message});
   }
 }

@@ -106,6 +106,6 @@ void Transaction::removePlugIns() {
 
 void Transaction::bulkPlugIns() {
   std::uint64_t flags = integerField(AXProtocol::kFlags);
-  os::Log::write(5, os::format("bulk options 0x%lx not supported", {flags}));
+  os::Log::notice("bulk options 0x%lx not supported", {flags});
   done();
 }

@@ -59,4 +59,8 @@ void Log::write(int level, std::string_view message) {
   (void)ignored;
 }
 
+void Log::notice(std::string_view format, std::initializer_list<FormatArg> arguments) {
+  write(5, os::format(format, arguments));
+}
+
 }  // namespace os

@@ -1,6 +1,9 @@
 #pragma once
 
+#include <initializer_list>
 #include <string_view>
+
+#include "platform/os/Format.h"
 
 namespace os {
 
@@ -11,6 +14,8 @@ class Log {
  public:
   // Syslog priorities: 3 error, 4 warning, 5 notice, 6 info, 7 debug.
   static void write(int level, std::string_view message);
+  // write() at level 5 of |format| filled with |arguments| (os::format).
+  static void notice(std::string_view format, std::initializer_list<FormatArg> arguments);
 };
 
 }  // namespace os
