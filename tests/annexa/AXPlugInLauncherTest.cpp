@@ -1,12 +1,9 @@
 #include <gtest/gtest.h>
-#include <sys/stat.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <cerrno>
+#include <vector>
 
 #include "Annexa/AXPlugInLauncher.h"
-#include "platform/launcher/ServiceLauncher.h"
 #include "platform/value/Value.h"
 #include "tests/platform/ScopedEnvironment.h"
 #include "tests/platform/TempDirectory.h"
@@ -30,13 +27,6 @@ Value info(Value identifier, Value version) {
 class AXPlugInLauncherTest : public ::testing::Test {
  protected:
   void SetUp() override { environment_.set("ANNEXA_ROOT", root_.path()); }
-
-  // A plug-in stand-in that exits with status 7.
-  std::string plugIn() const {
-    std::string path = root_.write("plugin", "#!/bin/sh\nexit 7\n");
-    chmod(path.c_str(), 0755);
-    return path;
-  }
 
   TempDirectory root_;
   ScopedEnvironment environment_;
@@ -64,27 +54,6 @@ TEST_F(AXPlugInLauncherTest, RefusesAFormThatNamesNoService) {
         << launched.error().message;
     EXPECT_NE(launched.error().message.find(kUuid), std::string::npos) << launched.error().message;
   }
-}
-
-TEST_F(AXPlugInLauncherTest, StartsOnlyWhatThisProcessWasMadeReadyFor) {
-  const Dictionary form = formWith(info(Value::string("com.x.p"), Value::string("1.0")));
-  os::Result<pid_t> nothingRecorded = AXPlugInLauncher::launch(form);
-  ASSERT_FALSE(nothingRecorded.ok());
-  EXPECT_EQ(nothingRecorded.error().errnum, EPERM);
-
-  // Ready for another process (our parent) is not ready for this one.
-  ASSERT_TRUE(
-      launcher::ServiceLauncher::addService(getppid(), "com.x.p", "1.0", plugIn(), {}).ok());
-  os::Result<pid_t> otherHost = AXPlugInLauncher::launch(form);
-  ASSERT_FALSE(otherHost.ok());
-  EXPECT_EQ(otherHost.error().errnum, EPERM);
-
-  ASSERT_TRUE(launcher::ServiceLauncher::addService(getpid(), "com.x.p", "1.0", plugIn(), {}).ok());
-  os::Result<pid_t> started = AXPlugInLauncher::launch(form);
-  ASSERT_TRUE(started.ok()) << started.error().message;
-  int status = 0;
-  ASSERT_EQ(waitpid(started.value(), &status, 0), started.value());
-  EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 7) << status;
 }
 
 }  // namespace

@@ -4,7 +4,6 @@
 #include <spawn.h>
 #include <stdio.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
 #include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -16,9 +15,7 @@
 #include <string>
 #include <vector>
 
-#include "Annexa/AXDaemonClient.h"
 #include "platform/launcher/ServiceLauncher.h"
-#include "platform/zyn/Listener.h"
 #include "tests/e2e/DaemonTest.h"
 #include "tests/platform/ScopedEnvironment.h"
 #include "tests/platform/TempDirectory.h"
@@ -229,103 +226,6 @@ TEST(Axctl, ServicesPrintsTheLauncherTableWithoutADaemon) {
   Subprocess::Outcome json = Subprocess::run(AXCTL_EXECUTABLE, {"--json", "services"});
   EXPECT_NE(json.out.find("\"host\": " + std::to_string(getpid())), std::string::npos) << json.out;
   EXPECT_NE(json.out.find("\"_SandboxProfile\": \"kbd\""), std::string::npos) << json.out;
-}
-
-// A stand-in for the daemon on a fresh device root, serving "test.axd" for axctl -S: discovery
-// finds plug-in kUuid only by its UUID rule, "ready" records it in the launcher's table for the
-// asking process (the plug-in exits with status 7), "access" gives two tokens.
-class StandInDaemon {
- public:
-  static constexpr const char* kUuid = "0738CB01-5194-415E-ACDD-AD377007A11B";
-
-  StandInDaemon() {
-    environment_.set("ANNEXA_ROOT", root_.path());
-    plugIn_ = root_.write("plugin", "#!/bin/sh\nexit 7\n");
-    chmod(plugIn_.c_str(), 0755);
-    auto listener = zyn::Listener::create("test.axd", std::make_shared<zyn::StrandQueue>("test"));
-    EXPECT_TRUE(listener.ok());
-    if (!listener.ok()) return;
-    listener.value()->setEventHandler([plugIn = plugIn_](std::shared_ptr<zyn::Connection> c) {
-      std::weak_ptr<zyn::Connection> weak = c;
-      c->setEventHandler([plugIn, weak](const zyn::Event& event) {
-        const auto* message = std::get_if<zyn::Message>(&event);
-        auto connection = weak.lock();
-        if (!message || !connection || !message->body.asDictionary()) return;
-        connection->send(answer(*message, connection->peerPid(), plugIn));
-      });
-      c->resume();
-    });
-    listener.value()->resume();
-  }
-
-  Subprocess::Outcome axctl(const std::vector<std::string>& arguments) const {
-    std::vector<std::string> all = {"-S", "test.axd"};
-    all.insert(all.end(), arguments.begin(), arguments.end());
-    return Subprocess::run(AXCTL_EXECUTABLE, all, {{"ANNEXA_ROOT", root_.path()}});
-  }
-
- private:
-  static zyn::Reply answer(const zyn::Message& message, pid_t peer, const std::string& plugIn) {
-    using value::Value;
-    const value::Dictionary& request = *message.body.asDictionary();
-    const std::string type = *request.find("request")->asString();
-    const Value uuidRule = Value::dictionary({{AXD_VENDOR_PREFIX ".uuid", Value::string(kUuid)}});
-    const Value* rules = request.find("rules");
-    const value::Uuid uuid = *value::Uuid::parse(kUuid);
-    zyn::Reply reply(message);
-    if (type == "match") {
-      value::Array forms;
-      if (rules && *rules == uuidRule) {
-        forms.push_back(Value::dictionary(
-            {{"uuid", Value::string(kUuid)},
-             {"bundleInfo",
-              Value::dictionary({{"QFBundleIdentifier", Value::string("com.x.p")},
-                                 {"QFBundleShortVersionString", Value::string("1.0")}})}}));
-      }
-      reply.set("matches", *AXDaemonClient::convertToZyn(Value::array(forms), 3));
-    } else if (type == "ready" && *request.find("uuids") == Value::array({Value::uuid(uuid)})) {
-      EXPECT_TRUE(launcher::ServiceLauncher::addService(peer, "com.x.p", "1.0", plugIn, {}).ok());
-    } else if (type == "access") {
-      reply.set("extensions", Value::array({Value::string("tok-a"), Value::string("tok-b")}));
-    } else {
-      reply.set("errorcode", Value::integer(4));
-      reply.set("error", Value::string("stand-in refuses " + type));
-    }
-    return reply;
-  }
-
-  TempDirectory root_;
-  ScopedEnvironment environment_;
-  std::string plugIn_;
-};
-
-bool isPidLine(const std::string& text) {
-  return text.size() > 1 && text.back() == '\n' &&
-         text.find_first_not_of("0123456789") == text.size() - 1;
-}
-
-TEST(Axctl, LaunchStartsThePlugInMadeReadyForItAndExitsWithItsStatus) {
-  StandInDaemon daemon;
-  std::string lower = StandInDaemon::kUuid;
-  for (char& c : lower) c = static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
-  Subprocess::Outcome waited = daemon.axctl({"launch", lower});
-  EXPECT_EQ(waited.status, 7) << waited.err;
-  EXPECT_TRUE(isPidLine(waited.out)) << waited.out;
-
-  Subprocess::Outcome started = daemon.axctl({"launch", "--no-wait", StandInDaemon::kUuid});
-  EXPECT_EQ(started.status, 0) << started.err;
-  EXPECT_TRUE(isPidLine(started.out)) << started.out;
-
-  Subprocess::Outcome unknown = daemon.axctl({"launch", "12345678-1234-1234-1234-123456789ABC"});
-  EXPECT_EQ(unknown.status, 1);
-  EXPECT_TRUE(unknown.err.starts_with("axctl: no plug-in 12345678-")) << unknown.err;
-}
-
-TEST(Axctl, AccessPrintsOneTokenPerLine) {
-  StandInDaemon daemon;
-  Subprocess::Outcome access = daemon.axctl({"access", StandInDaemon::kUuid});
-  EXPECT_EQ(access.status, 0) << access.err;
-  EXPECT_EQ(access.out, "tok-a\ntok-b\n");
 }
 
 // The names of the probes of provider axd that readelf lists in |binary|'s notes.

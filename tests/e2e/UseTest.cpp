@@ -409,6 +409,10 @@ TEST_F(UseTest, APlugInMadeReadyStartsWithTheDescribedEnvironmentAndOnlyThen) {
   }
   for (const std::string& line : lines) EXPECT_FALSE(line.starts_with("AXTEST_HOST_ONLY=")) << line;
   unsetenv("AXTEST_HOST_ONLY");
+
+  // axctl launch: ready for its own process, start, and the plug-in's exit status as its own.
+  Subprocess::Outcome launched = axctl({"launch", uuid(path).string()});
+  EXPECT_EQ(launched.status, 0) << launched.err;
 }
 
 }  // namespace
