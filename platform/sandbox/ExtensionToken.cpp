@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "platform/os/Digest.h"
+#include "platform/os/Text.h"
 #include "platform/sandbox/Hex.h"
 
 namespace sandbox {
@@ -14,16 +15,6 @@ namespace sandbox {
 namespace {
 
 constexpr std::string_view kVersion = "v1";
-
-std::vector<std::string_view> split(std::string_view text, char separator) {
-  std::vector<std::string_view> fields;
-  for (std::size_t start = 0;;) {
-    std::size_t end = text.find(separator, start);
-    fields.push_back(text.substr(start, end - start));
-    if (end == std::string_view::npos) return fields;
-    start = end + 1;
-  }
-}
 
 os::Error malformed() {
   return os::Error{EINVAL, "extension token: malformed"};
@@ -38,7 +29,7 @@ std::string ExtensionToken::seal(std::string_view key) const {
 }
 
 os::Result<ExtensionToken> ExtensionToken::open(std::string_view text, std::string_view key) {
-  std::vector<std::string_view> fields = split(text, ';');
+  std::vector<std::string_view> fields = os::split(text, ';');
   if (fields.size() != 4 || fields[0] != kVersion || fields[1].empty()) return malformed();
   std::optional<std::string> path = Hex::decode(fields[2]);
   std::optional<std::string> mac = Hex::decode(fields[3]);

@@ -1,0 +1,198 @@
+#include <gtest/gtest.h>
+
+#include <latch>
+#include <thread>
+#include <vector>
+
+#include "Annexa/AXInterfaceBuilder.h"
+#include "LogCapture.h"
+#include "PlugInFixtures.h"
+#include "platform/runtime/Runtime.h"
+
+namespace {
+
+using fixtures::A;
+using fixtures::I;
+using fixtures::S;
+using runtime::MessageInterface;
+using runtime::Runtime;
+
+// Protocols and classes live in the process's runtime, so every test uses names of its own.
+class AXInterfaceBuilder : public ::testing::Test {
+ protected:
+  static void SetUpTestSuite() {
+    Runtime& rt = Runtime::shared();
+    rt.addClass("ClassA", [](const value::Value& v) { return v.asString() != nullptr; });
+    rt.addClass("ClassB", [](const value::Value& v) { return v.isNumber(); });
+    rt.addProtocol("ToolProtocol", {}, {"perform:"});
+    rt.addProtocol("HostProtocol", {}, {"call:"});
+  }
+
+  std::optional<AXError> configure(const std::string& specification) {
+    return AXConfigureInterface(interface, "call:", specification);
+  }
+
+  static std::vector<std::string> classNames(const MessageInterface::ClassSet* classes) {
+    std::vector<std::string> names;
+    if (classes) {
+      for (const auto& c : *classes) names.push_back(c->name());
+    }
+    return names;
+  }
+
+  MessageInterface interface { Runtime::shared().lookUpProtocol("HostProtocol") };
+};
+
+void expectMalformed(const std::optional<AXError>& error, const std::string& message) {
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->domain(), "Annexa");
+  EXPECT_EQ(error->code(), 6);
+  EXPECT_EQ(error->localizedDescription(), message);
+}
+
+TEST_F(AXInterfaceBuilder, EntriesSetClassesOrNestedInterfacesPerDirection) {
+  EXPECT_FALSE(configure("request:0:{ClassA+ClassB},reply:1:{ClassA},request:2:ToolProtocol"));
+  using Names = std::vector<std::string>;
+  EXPECT_EQ(classNames(interface.classes("call:", 0, false)), (Names{"ClassA", "ClassB"}));
+  EXPECT_EQ(classNames(interface.classes("call:", 1, true)), (Names{"ClassA"}));
+  EXPECT_EQ(interface.classes("call:", 1, false), nullptr);
+  auto nested = interface.interface("call:", 2, false);
+  ASSERT_TRUE(nested);
+  EXPECT_EQ(nested->protocol()->name(), "ToolProtocol");
+
+  // The index reads like a C integer: leading digits count, other text is 0.
+  EXPECT_FALSE(configure("reply:7th:{ClassB},reply:x:{ClassB}"));
+  EXPECT_EQ(classNames(interface.classes("call:", 7, true)), (Names{"ClassB"}));
+  EXPECT_EQ(classNames(interface.classes("call:", 0, true)), (Names{"ClassB"}));
+}
+
+TEST_F(AXInterfaceBuilder, MalformedSpecificationsNameTheOffendingPart) {
+  expectMalformed(configure(""), "");
+  expectMalformed(configure("request:0"), "request:0");
+  expectMalformed(configure("request:0:{ClassA}:x"), "request:0:{ClassA}:x");
+  expectMalformed(configure("call:0:{ClassA}"), "call");
+  expectMalformed(configure("request:0:{ClassA"), "{ClassA");
+  expectMalformed(configure("request:0:{"), "{");
+  expectMalformed(configure("request:0:{}"), "");
+  expectMalformed(configure("request:0:{ClassA++ClassB}"), "");
+  expectMalformed(configure("request:0:"), "");
+  expectMalformed(configure("request:0:ClassA}"), "ClassA}");
+  // The whole specification is the message, not the entry, when the parts do not count three.
+  expectMalformed(configure("request:0:{ClassA},reply:1"), "request:0:{ClassA},reply:1");
+}
+
+TEST_F(AXInterfaceBuilder, AFailureStopsAtItsEntryAndKeepsTheEarlierOnes) {
+  expectMalformed(configure("reply:3:{ClassB},request:0:{ClassA+NoSuchClass},reply:0:{ClassA}"),
+                  "NoSuchClass");
+  EXPECT_NE(interface.classes("call:", 3, true), nullptr);
+  EXPECT_EQ(interface.classes("call:", 0, false), nullptr);
+  EXPECT_EQ(interface.classes("call:", 0, true), nullptr);
+
+  LogCapture log;
+  expectMalformed(configure("request:4:NoSuchProtocol"), "NoSuchProtocol");
+  EXPECT_EQ(interface.interface("call:", 4, false), nullptr);
+  EXPECT_NE(log.text().find("unable to locate protocol \"NoSuchProtocol\""), std::string::npos);
+}
+
+TEST_F(AXInterfaceBuilder, LookUpLogsAndReportsAMissingProtocol) {
+  EXPECT_EQ(AXLookUpProtocol("ToolProtocol"), Runtime::shared().lookUpProtocol("ToolProtocol"));
+  EXPECT_TRUE(AXLookUpProtocol("QSObject"));
+
+  LogCapture log;
+  std::optional<AXError> error;
+  EXPECT_EQ(AXLookUpProtocol("Absent", &error), nullptr);
+  const std::string message =
+      "unable to locate protocol \"Absent\" - check that it is defined and not inadvertently "
+      "optimized away";
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->code(), 12);
+  EXPECT_EQ(error->localizedDescription(), message);
+  EXPECT_NE(log.text().find(message), std::string::npos);
+}
+
+TEST_F(AXInterfaceBuilder, SpecificationsOfOtherTypesGiveNothingAndNoError) {
+  std::optional<AXError> error;
+  EXPECT_EQ(AXProtocolFromSpec(I(5), &error), nullptr);
+  EXPECT_EQ(AXProtocolFromSpec(value::Value(), &error), nullptr);
+  EXPECT_FALSE(error);
+  EXPECT_EQ(AXProtocolFromSpec(S("ToolProtocol")), AXLookUpProtocol("ToolProtocol"));
+}
+
+TEST_F(AXInterfaceBuilder, ACompoundIsMadeOnceAndFoundByName) {
+  Runtime::shared().addProtocol("CompoundA", {}, {"a"});
+  Runtime::shared().addProtocol("CompoundB", {}, {"b"});
+  auto compound = AXProtocolFromSpec(A({S("CompoundA"), S("CompoundB")}));
+  ASSERT_TRUE(compound);
+  EXPECT_EQ(compound->name(), "__XX_COMPOUND__CompoundA__CompoundB");
+  EXPECT_EQ(Runtime::shared().lookUpProtocol(compound->name()), compound);
+  ASSERT_EQ(compound->adoptedProtocols().size(), 2u);
+  EXPECT_EQ(compound->adoptedProtocols()[0]->name(), "CompoundA");
+  EXPECT_TRUE(compound->declares("a") && compound->declares("b"));
+
+  EXPECT_EQ(AXProtocolFromSpec(A({S("CompoundA"), S("CompoundB")})), compound);
+  auto reversed = AXProtocolFromSpec(A({S("CompoundB"), S("CompoundA")}));
+  ASSERT_TRUE(reversed);
+  EXPECT_NE(reversed, compound);
+}
+
+TEST_F(AXInterfaceBuilder, AHalfMadeCompoundIsMadeAgainUnderTheSameName) {
+  Runtime::shared().addProtocol("HalfA", {}, {});
+  const std::string name = "__XX_COMPOUND__HalfA__HalfLater";
+  {
+    LogCapture log;
+    std::optional<AXError> error;
+    EXPECT_EQ(AXProtocolFromSpec(A({S("HalfA"), S("HalfLater")}), &error), nullptr);
+    ASSERT_TRUE(error);
+    EXPECT_EQ(error->code(), 12);
+    EXPECT_NE(error->localizedDescription()->find("\"HalfLater\""), std::string::npos);
+    std::string text = log.text();
+    EXPECT_EQ(text.find("unable to locate"), text.rfind("unable to locate"));  // logged once
+    EXPECT_EQ(Runtime::shared().lookUpProtocol(name), nullptr);
+  }
+  Runtime::shared().addProtocol("HalfLater", {}, {});
+  std::optional<AXError> error;
+  auto compound = AXProtocolFromSpec(A({S("HalfA"), S("HalfLater")}), &error);
+  ASSERT_TRUE(compound);
+  EXPECT_FALSE(error);
+  EXPECT_EQ(compound->name(), name);
+  EXPECT_EQ(compound->adoptedProtocols().size(), 2u);
+}
+
+TEST_F(AXInterfaceBuilder, ANonStringElementIsAMissingProtocolNamedByItsDescription) {
+  LogCapture log;
+  std::optional<AXError> error;
+  EXPECT_EQ(AXProtocolFromSpec(A({S("ToolProtocol"), I(7)}), &error), nullptr);
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->code(), 12);
+  EXPECT_NE(log.text().find("unable to locate protocol \"7\""), std::string::npos);
+}
+
+TEST_F(AXInterfaceBuilder, ThreadsBuildingOneCompoundAtOnceGetOneProtocol) {
+  constexpr int kThreads = 8;
+  constexpr int kRounds = 50;
+  Runtime::shared().addProtocol("RaceBase", {}, {});
+  for (int round = 0; round < kRounds; ++round) {
+    Runtime::shared().addProtocol("Race" + std::to_string(round), {}, {});
+  }
+  std::vector<std::vector<std::shared_ptr<const runtime::Protocol>>> got(
+      kThreads, std::vector<std::shared_ptr<const runtime::Protocol>>(kRounds));
+  std::latch start(kThreads);
+  std::vector<std::thread> threads;
+  for (int t = 0; t < kThreads; ++t) {
+    threads.emplace_back([&, t] {
+      start.arrive_and_wait();
+      for (int round = 0; round < kRounds; ++round) {
+        got[t][round] = AXProtocolFromSpec(A({S("RaceBase"), S("Race" + std::to_string(round))}));
+      }
+    });
+  }
+  for (auto& thread : threads) thread.join();
+  for (int round = 0; round < kRounds; ++round) {
+    auto registered =
+        Runtime::shared().lookUpProtocol("__XX_COMPOUND__RaceBase__Race" + std::to_string(round));
+    ASSERT_TRUE(registered);
+    for (int t = 0; t < kThreads; ++t) EXPECT_EQ(got[t][round], registered);
+  }
+}
+
+}  // namespace

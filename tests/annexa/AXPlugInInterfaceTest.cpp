@@ -1,0 +1,81 @@
+#include <gtest/gtest.h>
+
+#include "Annexa/AXPlugInInterface.h"
+#include "LogCapture.h"
+#include "PlugInFixtures.h"
+#include "platform/runtime/Runtime.h"
+
+namespace {
+
+using namespace fixtures;
+using runtime::Runtime;
+
+// The form that discovery would send for a plug-in at |path| whose plug-in dictionary is |plugIn|.
+value::Dictionary formOf(value::Value plugIn, const char* path = kAppexPath) {
+  auto r = record(path, manifest(std::move(plugIn)));
+  r->canonicalize();
+  return r->exportForm();
+}
+
+class AXPlugInInterfaceMake : public ::testing::Test {
+ protected:
+  static void SetUpTestSuite() {
+    Runtime::shared().addProtocol("ShareProtocol", {}, {"share:progress:"});
+    Runtime::shared().addProtocol("CancelProtocol", {}, {"cancel"});
+    Runtime::shared().addProtocol("ProgressProtocol", {}, {"report:"});
+  }
+
+  static std::optional<AXError> failure(
+      const value::Dictionary& form, const AXPlugInInterface::Configuration& configuration = {}) {
+    std::optional<AXError> error;
+    EXPECT_EQ(AXPlugInInterface::make(form, configuration, &error), nullptr);
+    return error;
+  }
+};
+
+TEST_F(AXPlugInInterfaceMake, ConfiguresTheInterfaceOfTheManifestsProtocol) {
+  auto form = formOf(D({{"QSExtensionProtocol", A({S("ShareProtocol"), S("CancelProtocol")})}}));
+  std::optional<AXError> error;
+  auto interface = AXPlugInInterface::make(
+      form, {{"share:progress:", "request:0:{String},request:1:ProgressProtocol"}}, &error);
+  ASSERT_TRUE(interface) << error->description();
+  EXPECT_EQ(interface->protocol()->name(), "__XX_COMPOUND__ShareProtocol__CancelProtocol");
+
+  auto progress = runtime::Argument::proxy(Runtime::shared().lookUpProtocol("ProgressProtocol"));
+  EXPECT_TRUE(interface->checkArguments("share:progress:", false, {S("hello"), progress}).ok());
+  os::Status refused = interface->checkArguments("share:progress:", false, {I(42), progress});
+  ASSERT_FALSE(refused.ok());
+  EXPECT_EQ(refused.error().message, "argument 0 of share:progress: must be one of String, not 42");
+  EXPECT_TRUE(interface->checkArguments("cancel", false, {}).ok());
+}
+
+TEST_F(AXPlugInInterfaceMake, AnAppExtensionThatNamesNoProtocolSpeaksTheRootProtocol) {
+  auto interface = AXPlugInInterface::make(formOf(D({})), {});
+  ASSERT_TRUE(interface);
+  EXPECT_EQ(interface->protocol()->name(), "QSObject");
+}
+
+TEST_F(AXPlugInInterfaceMake, RefusesWhatCannotBeTalkedTo) {
+  EXPECT_EQ(failure(value::Dictionary())->code(), 4);
+
+  auto data = failure(formOf(D({{"QSExtensionProtocol", S("#Data")}})));
+  EXPECT_EQ(data->code(), 12);
+  EXPECT_EQ(data->localizedDescription(), "com.example.tool is a data plug-in: it has no protocol");
+
+  auto none = failure(formOf(D({}), kBundlePath));
+  EXPECT_EQ(none->code(), 12);
+  EXPECT_EQ(none->localizedDescription(),
+            "com.example.tool names no protocol: \"QSExtensionProtocol\" is absent");
+
+  EXPECT_EQ(failure(formOf(D({{"QSExtensionProtocol", I(3)}})))->code(), 12);
+
+  LogCapture log;
+  EXPECT_EQ(failure(formOf(D({{"QSExtensionProtocol", S("Unknown")}})))->code(), 12);
+
+  auto badSpecification = failure(formOf(D({{"QSExtensionProtocol", S("ShareProtocol")}})),
+                                  {{"share:progress:", "request:0:{String},call:1:{String}"}});
+  EXPECT_EQ(badSpecification->code(), 6);
+  EXPECT_EQ(badSpecification->localizedDescription(), "call");
+}
+
+}  // namespace
