@@ -18,13 +18,14 @@ class AXPlugInInterface {
   // One selector and the interface specification to apply to it (AXConfigureInterface).
   using Configuration = std::vector<std::pair<std::string, std::string>>;
 
-  // Rebuilds the record of |form| (a form as discovery returns it), makes the protocol of its
-  // protocol specification (AXProtocolFromSpec; an app extension that names none speaks
-  // "QSObject") and applies |configuration| in order to a new interface of that protocol.
-  // Returns null and stores the reason in |error| when it is given: code 4 for a form from which
-  // no record can be rebuilt; code 12 for a data plug-in (it runs no code), a plug-in that names
-  // no protocol or names one that cannot be found or made; code 6 for the first malformed
-  // specification of |configuration|.
+  // Makes the protocol of the protocol specification in the "info" of |form| (a form as
+  // discovery returns it: its plug-in dictionary, merged with the extension point's SDK) with
+  // AXProtocolFromSpec, where an app extension that names none speaks "QSObject", and applies
+  // |configuration| in order to a new interface of that protocol. Returns null and stores the
+  // reason in |error| when it is given: code 4 for a form without a string "identifier", a
+  // string "path" and a dictionary "info"; code 12 for a data plug-in (it runs no code), a plug-in
+  // that names no protocol or names one that cannot be found or made; code 6 for the first
+  // malformed specification of |configuration|.
   static std::shared_ptr<runtime::MessageInterface> make(const value::Dictionary& form,
                                                          const Configuration& configuration,
                                                          std::optional<AXError>* error = nullptr);

@@ -1,6 +1,7 @@
 #include <gtest/gtest.h>
 
 #include "Annexa/AXPlugInInterface.h"
+#include "Annexa/AXUtilities.h"
 #include "LogCapture.h"
 #include "PlugInFixtures.h"
 #include "platform/runtime/Runtime.h"
@@ -10,11 +11,13 @@ namespace {
 using namespace fixtures;
 using runtime::Runtime;
 
-// The form that discovery would send for a plug-in at |path| whose plug-in dictionary is |plugIn|.
+// The form that discovery would send for a plug-in at |path| whose plug-in dictionary, merged
+// with its SDK, is |plugIn|: the manifest in "bundleInfo" names no protocol, as when the SDK
+// gives it.
 value::Dictionary formOf(value::Value plugIn, const char* path = kAppexPath) {
-  auto r = record(path, manifest(std::move(plugIn)));
+  auto r = record(path, manifest(D({})));
   r->canonicalize();
-  return r->exportForm();
+  return dictionaryChanging(r->exportForm(), "info", std::move(plugIn));
 }
 
 class AXPlugInInterfaceMake : public ::testing::Test {

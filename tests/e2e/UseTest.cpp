@@ -14,10 +14,12 @@
 #include <string>
 #include <vector>
 
+#include "Annexa/AXPlugInInterface.h"
 #include "Annexa/AXPlugInLauncher.h"
 #include "Annexa/AXProtocol.h"
 #include "platform/launcher/ServiceLauncher.h"
 #include "platform/registrum/Workspace.h"
+#include "platform/runtime/Runtime.h"
 #include "platform/sandbox/Sandbox.h"
 #include "tests/e2e/Bundles.h"
 #include "tests/e2e/DaemonTest.h"
@@ -97,18 +99,24 @@ class UseTest : public DaemonTest {
     return token && token->asUuid() ? *token->asUuid() : Uuid();
   }
 
-  // The identifiers that a match request returns to this program.
-  std::set<std::string> visible() {
+  // The forms that a match request returns to this program, by identifier.
+  std::map<std::string, Dictionary> discovered() {
     auto request = client_->client().request(AXProtocol::kMatch);
     request[AXProtocol::kFlags] = Value::unsignedInteger(0);
     Dictionary fields = reply(*client_, request);
     const Value* matches = fields.find(AXProtocol::kMatches);
     std::optional<Value> forms =
         matches ? client_->client().convertFromZyn(*matches) : std::nullopt;
-    std::set<std::string> ids;
+    std::map<std::string, Dictionary> found;
     for (const Value& form : forms && forms->asArray() ? *forms->asArray() : value::Array()) {
-      ids.insert(*form.asDictionary()->find("identifier")->asString());
+      found[*form.asDictionary()->find("identifier")->asString()] = *form.asDictionary();
     }
+    return found;
+  }
+  // The identifiers that a match request returns to this program.
+  std::set<std::string> visible() {
+    std::set<std::string> ids;
+    for (const auto& [id, form] : discovered()) ids.insert(id);
     return ids;
   }
   // The launcher's services, by bundle identifier.
@@ -413,6 +421,28 @@ TEST_F(UseTest, APlugInMadeReadyStartsWithTheDescribedEnvironmentAndOnlyThen) {
   // axctl launch: ready for its own process, start, and the plug-in's exit status as its own.
   Subprocess::Outcome launched = axctl({"launch", uuid(path).string()});
   EXPECT_EQ(launched.status, 0) << launched.err;
+}
+
+TEST_F(UseTest, AHostBuildsTheInterfaceOfTheProtocolThatADiscoveredPlugInNames) {
+  boot();
+  runtime::Runtime::shared().addProtocol("e2e.Talking", {}, {"talk:"});
+  runtime::Runtime::shared().addProtocol("e2e.Cancelling", {}, {"cancel"});
+  Value compound = Value::array({Value::string("e2e.Talking"), Value::string("e2e.Cancelling")});
+  install("Tools", {.id = "talker", .extension = {{"QSExtensionProtocol", compound}}});
+  install("Tools", {.id = "data", .extension = {{"QSExtensionProtocol", Value::string("#Data")}}});
+  std::map<std::string, Dictionary> forms = discovered();
+  ASSERT_EQ(forms.size(), 2u);
+
+  std::optional<AXError> error;
+  auto interface =
+      AXPlugInInterface::make(forms["talker"], {{"talk:", "request:0:{String}"}}, &error);
+  ASSERT_TRUE(interface) << error->description();
+  EXPECT_EQ(interface->protocol()->name(), "__XX_COMPOUND__e2e.Talking__e2e.Cancelling");
+  EXPECT_TRUE(interface->checkArguments("talk:", false, {Value::string("hi")}).ok());
+  EXPECT_FALSE(interface->checkArguments("talk:", false, {Value::integer(1)}).ok());
+
+  EXPECT_EQ(AXPlugInInterface::make(forms["data"], {}, &error), nullptr);
+  EXPECT_EQ(error->code(), 12);
 }
 
 }  // namespace
