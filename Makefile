@@ -1,14 +1,17 @@
 # Thin wrapper over CMake. `make demo` runs the daemon on a demo device; `make test` builds and
-# runs every test, then the whole suite again under AddressSanitizer + UndefinedBehaviorSanitizer.
+# runs every test, then the whole suite again under AddressSanitizer + UndefinedBehaviorSanitizer,
+# then the in-process suites under ThreadSanitizer.
 
 JOBS ?= $(shell nproc)
 BUILD ?= build
 ASAN_BUILD ?= build-asan
+TSAN_BUILD ?= build-tsan
+TSAN_SUITES = platform_tests annexa_tests plugin_tests axd_tests
 BENCH_BUILD ?= build-bench
 FUZZ_BUILD ?= build-fuzz
 FUZZ_SECONDS ?= 60
 
-.PHONY: all bootstrap build test test-asan demo bench fuzz format clean
+.PHONY: all bootstrap build test test-asan test-tsan demo bench fuzz format clean
 
 all: build
 
@@ -22,11 +25,18 @@ build: bootstrap
 test: build
 	cd $(BUILD) && ctest --output-on-failure -j $(JOBS)
 	$(MAKE) test-asan
+	$(MAKE) test-tsan
 
 test-asan: bootstrap
 	cmake -S . -B $(ASAN_BUILD) -DCMAKE_BUILD_TYPE=Debug -DAXD_SANITIZE=ON >/dev/null
 	cmake --build $(ASAN_BUILD) -j $(JOBS)
 	cd $(ASAN_BUILD) && ASAN_OPTIONS=detect_leaks=1 ctest --output-on-failure -j $(JOBS)
+
+# The in-process suites hold every concurrency test; the end-to-end suite adds only processes.
+test-tsan: bootstrap
+	cmake -S . -B $(TSAN_BUILD) -DCMAKE_BUILD_TYPE=Debug -DAXD_TSAN=ON >/dev/null
+	cmake --build $(TSAN_BUILD) -j $(JOBS) --target $(TSAN_SUITES)
+	for suite in $(TSAN_SUITES); do $(TSAN_BUILD)/tests/$$suite --gtest_brief=1 || exit 1; done
 
 demo: build
 	scripts/demo $(BUILD)
@@ -47,4 +57,4 @@ format:
 	git ls-files '*.h' '*.cpp' | xargs clang-format -i
 
 clean:
-	rm -rf $(BUILD) $(ASAN_BUILD) $(BENCH_BUILD) $(FUZZ_BUILD)
+	rm -rf $(BUILD) $(ASAN_BUILD) $(TSAN_BUILD) $(BENCH_BUILD) $(FUZZ_BUILD)
