@@ -140,7 +140,6 @@ TEST(AXDaemonClientReplies, ErrorInReplyReadsCodeAndMessage) {
 TEST(AXDaemonClientReplies, TheEnvelopeExistsOnlyInVersion3) {
   Value list = Value::array({Value::dictionary({{"identifier", Value::string("x")}})});
   EXPECT_FALSE(AXDaemonClient::convertToZyn(list, 2));
-  EXPECT_FALSE(AXDaemonClient::convertToZyn(list, 4));
   auto envelope = AXDaemonClient::convertToZyn(list, 3);
   ASSERT_TRUE(envelope);
 
@@ -152,10 +151,6 @@ TEST(AXDaemonClientReplies, TheEnvelopeExistsOnlyInVersion3) {
   EXPECT_FALSE(client.convertFromZyn(list));
   client.setProtocolVersion(2);
   EXPECT_FALSE(client.convertFromZyn(*envelope));
-}
-
-TEST(AXDaemonClientReplies, DefaultServiceFollowsTheVendorPrefix) {
-  EXPECT_EQ(AXDaemonClient::defaultServiceName(), std::string(AXD_VENDOR_PREFIX) + ".annexa.axd");
 }
 
 }  // namespace

@@ -68,17 +68,19 @@ TEST_F(AXInterfaceBuilder, EntriesSetClassesOrNestedInterfacesPerDirection) {
 
 TEST_F(AXInterfaceBuilder, MalformedSpecificationsNameTheOffendingPart) {
   expectMalformed(configure(""), "");
-  expectMalformed(configure("request:0"), "request:0");
-  expectMalformed(configure("request:0:{ClassA}:x"), "request:0:{ClassA}:x");
   expectMalformed(configure("call:0:{ClassA}"), "call");
   expectMalformed(configure("request:0:{ClassA"), "{ClassA");
   expectMalformed(configure("request:0:{"), "{");
   expectMalformed(configure("request:0:{}"), "");
-  expectMalformed(configure("request:0:{ClassA++ClassB}"), "");
-  expectMalformed(configure("request:0:"), "");
-  expectMalformed(configure("request:0:ClassA}"), "ClassA}");
+  // The parts are counted before the kind is read.
+  expectMalformed(configure("call:0"), "call:0");
   // The whole specification is the message, not the entry, when the parts do not count three.
   expectMalformed(configure("request:0:{ClassA},reply:1"), "request:0:{ClassA},reply:1");
+
+  // An empty third part names nothing: refused before any lookup, so nothing is logged.
+  LogCapture log;
+  expectMalformed(configure("request:0:"), "");
+  EXPECT_EQ(log.text(), "");
 }
 
 TEST_F(AXInterfaceBuilder, AFailureStopsAtItsEntryAndKeepsTheEarlierOnes) {
@@ -91,12 +93,14 @@ TEST_F(AXInterfaceBuilder, AFailureStopsAtItsEntryAndKeepsTheEarlierOnes) {
   LogCapture log;
   expectMalformed(configure("request:4:NoSuchProtocol"), "NoSuchProtocol");
   EXPECT_EQ(interface.interface("call:", 4, false), nullptr);
-  EXPECT_NE(log.text().find("unable to locate protocol \"NoSuchProtocol\""), std::string::npos);
+  const std::string text = log.text();
+  const std::string line = "unable to locate protocol \"NoSuchProtocol\"";
+  EXPECT_NE(text.find(line), std::string::npos);
+  EXPECT_EQ(text.find(line), text.rfind(line));  // logged once
 }
 
-TEST_F(AXInterfaceBuilder, LookUpLogsAndReportsAMissingProtocol) {
-  EXPECT_EQ(AXLookUpProtocol("ToolProtocol"), Runtime::shared().lookUpProtocol("ToolProtocol"));
-  EXPECT_TRUE(AXLookUpProtocol("QSObject"));
+TEST_F(AXInterfaceBuilder, AMissingProtocolIsLoggedAndReportedWithCode12) {
+  EXPECT_TRUE(AXLookUpProtocol("QSObject"));  // the root protocol exists without being added
 
   LogCapture log;
   std::optional<AXError> error;
@@ -108,14 +112,19 @@ TEST_F(AXInterfaceBuilder, LookUpLogsAndReportsAMissingProtocol) {
   EXPECT_EQ(error->code(), 12);
   EXPECT_EQ(error->localizedDescription(), message);
   EXPECT_NE(log.text().find(message), std::string::npos);
-}
 
-TEST_F(AXInterfaceBuilder, SpecificationsOfOtherTypesGiveNothingAndNoError) {
-  std::optional<AXError> error;
+  // In a compound, an element that is no name is missing under its description.
+  error.reset();
+  EXPECT_EQ(AXProtocolFromSpec(A({S("ToolProtocol"), I(7)}), &error), nullptr);
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->code(), 12);
+  EXPECT_NE(log.text().find("unable to locate protocol \"7\""), std::string::npos);
+
+  // A value that is neither a name nor a list names nothing, and that is no error.
+  error.reset();
   EXPECT_EQ(AXProtocolFromSpec(I(5), &error), nullptr);
   EXPECT_EQ(AXProtocolFromSpec(value::Value(), &error), nullptr);
   EXPECT_FALSE(error);
-  EXPECT_EQ(AXProtocolFromSpec(S("ToolProtocol")), AXLookUpProtocol("ToolProtocol"));
 }
 
 TEST_F(AXInterfaceBuilder, ACompoundIsMadeOnceAndFoundByName) {
@@ -136,35 +145,29 @@ TEST_F(AXInterfaceBuilder, ACompoundIsMadeOnceAndFoundByName) {
 }
 
 TEST_F(AXInterfaceBuilder, AHalfMadeCompoundIsMadeAgainUnderTheSameName) {
+  // The missing protocol is registered half-way, so each run of this test needs a name of its own.
+  static int run = 0;
+  const std::string later = "HalfLater" + std::to_string(++run);
   Runtime::shared().addProtocol("HalfA", {}, {});
-  const std::string name = "__XX_COMPOUND__HalfA__HalfLater";
+  const std::string name = "__XX_COMPOUND__HalfA__" + later;
   {
     LogCapture log;
     std::optional<AXError> error;
-    EXPECT_EQ(AXProtocolFromSpec(A({S("HalfA"), S("HalfLater")}), &error), nullptr);
+    EXPECT_EQ(AXProtocolFromSpec(A({S("HalfA"), S(later)}), &error), nullptr);
     ASSERT_TRUE(error);
     EXPECT_EQ(error->code(), 12);
-    EXPECT_NE(error->localizedDescription()->find("\"HalfLater\""), std::string::npos);
+    EXPECT_NE(error->localizedDescription()->find("\"" + later + "\""), std::string::npos);
     std::string text = log.text();
     EXPECT_EQ(text.find("unable to locate"), text.rfind("unable to locate"));  // logged once
     EXPECT_EQ(Runtime::shared().lookUpProtocol(name), nullptr);
   }
-  Runtime::shared().addProtocol("HalfLater", {}, {});
+  Runtime::shared().addProtocol(later, {}, {});
   std::optional<AXError> error;
-  auto compound = AXProtocolFromSpec(A({S("HalfA"), S("HalfLater")}), &error);
+  auto compound = AXProtocolFromSpec(A({S("HalfA"), S(later)}), &error);
   ASSERT_TRUE(compound);
   EXPECT_FALSE(error);
   EXPECT_EQ(compound->name(), name);
   EXPECT_EQ(compound->adoptedProtocols().size(), 2u);
-}
-
-TEST_F(AXInterfaceBuilder, ANonStringElementIsAMissingProtocolNamedByItsDescription) {
-  LogCapture log;
-  std::optional<AXError> error;
-  EXPECT_EQ(AXProtocolFromSpec(A({S("ToolProtocol"), I(7)}), &error), nullptr);
-  ASSERT_TRUE(error);
-  EXPECT_EQ(error->code(), 12);
-  EXPECT_NE(log.text().find("unable to locate protocol \"7\""), std::string::npos);
 }
 
 TEST_F(AXInterfaceBuilder, ThreadsBuildingOneCompoundAtOnceGetOneProtocol) {

@@ -111,19 +111,18 @@ TEST_F(AXDPlugInPolicyTest, TheFirstRefusalWins) {
   } cases[] = {
       {{{allowedPlugIns, onlyABC}}, "a.b.c", std::nullopt, ""},
       {{{allowedPlugIns, onlyABC}}, "a.b.cd", std::nullopt, restricted},
-      {{{allowedPlugIns, onlyABC}}, "A.B.C", std::nullopt, restricted},
       {{{allowedPlugIns, onlyABC}}, "a.b.d", S("x"), restricted},
       {{{allowedPlugIns, onlyABC}}, "a.b.c", S("x"), noX},
-      {{{allowedPlugIns, S("a.b.c")}}, "a.b.c", std::nullopt, invalid},
       {{{allowedPlugIns, A({onlyABC})}}, "a.b.c", std::nullopt, invalid},
       {{{allowedPlugIns, D({})}}, "a.b.e", std::nullopt, ""},
       {{}, "a.b.f", std::nullopt, ""},
-      {{}, "a.b.g", S("x"), noX},
+      // The client's entitlement counts unless it is false or zero.
       {{{"x", Value::boolean(false)}}, "a.b.g", S("x"), noX},
       {{{"x", Value::integer(0)}}, "a.b.g", S("x"), noX},
       {{{"x", Value::boolean(true)}}, "a.b.g", S("x"), ""},
+      {{{"x", Value::real(0.5)}}, "a.b.g", S("x"), ""},
       {{{"x", S("")}}, "a.b.g", S("x"), ""},
-      {{}, "a.b.h", Value::boolean(true), ""},
+      {{}, "a.b.h", Value::boolean(true), ""},  // a demand that names nothing demands nothing
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(Value::dictionary(c.entitlements).description() + " " + c.identifier);
@@ -132,32 +131,29 @@ TEST_F(AXDPlugInPolicyTest, TheFirstRefusalWins) {
 }
 
 TEST_F(AXDPlugInPolicyTest, ConsentServicesAreTheGrantedOnesOfTheApplication) {
-  writePlist(root() + "/Apps/Consent.app/Info.plist",
-             Value::dictionary({{"QFBundleIdentifier", S("com.example.consent")}}));
+  for (const char* app : {"Consent", "Broken"}) {
+    writePlist(root() + "/Apps/" + app + ".app/Info.plist",
+               Value::dictionary({{"QFBundleIdentifier", S(std::string("com.example.") + app)}}));
+  }
+  writePlist(root() + "/Apps/Anonymous.app/Info.plist", D({}));
   auto plugIn = record("policy.consent", std::nullopt, "Apps/Consent.app");
   auto entry = [](const char* service, std::optional<bool> granted) {
     Dictionary fields{{"Service", S(service)}};
     return Value::dictionary(granted ? fields.with("Granted", Value::boolean(*granted)) : fields);
   };
   EXPECT_EQ(plugIn->allowedPCXServices(), std::set<std::string>{});
-  writePlist(
-      consentFile(),
-      D({{"com.example.consent", A({entry("network", true), entry("camera", false),
-                                    entry("microphone", std::nullopt), entry("photos", true)})},
-         {"com.example.other", A({entry("location", true)})}}));
-  EXPECT_EQ(plugIn->allowedPCXServices(), (std::set<std::string>{"network", "photos"}));
-  EXPECT_EQ(record("policy.system", std::nullopt, "")->allowedPCXServices(),
-            std::set<std::string>{});
+  writePlist(consentFile(),
+             D({{"com.example.Consent", A({entry("network", true), entry("camera", false),
+                                           entry("microphone", std::nullopt)})},
+                {"com.example.Broken", S("network")}}));
+  EXPECT_EQ(plugIn->allowedPCXServices(), std::set<std::string>{"network"});
   // Read afresh at every call.
-  writePlist(consentFile(), D({{"com.example.consent", A({entry("camera", true)})}}));
+  writePlist(consentFile(), D({{"com.example.Consent", A({entry("camera", true)})},
+                               {"com.example.Broken", S("network")}}));
   EXPECT_EQ(plugIn->allowedPCXServices(), std::set<std::string>{"camera"});
-}
 
-TEST_F(AXDPlugInPolicyTest, AnUnreadableApplicationOrStoreGrantsNothing) {
-  writePlist(root() + "/Apps/Anonymous.app/Info.plist", D({}));
-  writePlist(root() + "/Apps/Broken.app/Info.plist",
-             Value::dictionary({{"QFBundleIdentifier", S("com.example.broken")}}));
-  writePlist(consentFile(), D({{"com.example.broken", S("network")}}));
+  // Nothing outside an application, nor when the application or its entries cannot be read.
+  EXPECT_TRUE(record("policy.system", std::nullopt, "")->allowedPCXServices().empty());
   auto missing = record("policy.missing", std::nullopt, "Apps/Missing.app");
   EXPECT_TRUE(missing->allowedPCXServices().empty());
   EXPECT_TRUE(

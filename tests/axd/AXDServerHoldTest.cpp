@@ -1,21 +1,17 @@
 // The server's holds: what they cover, release by token, and release when their client dies.
+// That discovery leaves held plug-ins out is checked end to end.
 
 #include <gtest/gtest.h>
 
-#include <filesystem>
-#include <fstream>
 #include <string>
 #include <vector>
 
-#include "Annexa/AXProtocol.h"
 #include "axd/AXDNames.h"
 #include "platform/notify/Notification.h"
 #include "platform/os/OpenWork.h"
-#include "platform/value/PropertyList.h"
 #include "tests/axd/InProcessServer.h"
 #include "tests/axd/PlugInShelf.h"
 #include "tests/axd/SelfClient.h"
-#include "tests/support/BlockingClient.h"
 
 namespace {
 
@@ -86,56 +82,6 @@ TEST_F(AXDServerHoldTest, ADeadClientReleasesExactlyItsOwnHolds) {
   EXPECT_EQ(holds[0], keeper);
   EXPECT_TRUE(server_->holdOnPlugIn(*held));
   server_->unholdToken(keeper->uuid());
-}
-
-// The identifiers of the plug-ins with |ids| that a match request with |flags| returns, in order.
-std::vector<std::string> discovered(BlockingClient& client, const std::vector<std::string>& ids,
-                                    std::uint64_t flags) {
-  value::Array names;
-  for (const std::string& id : ids) names.push_back(value::Value::string(id));
-  AXDaemonClient::Request request = client.client().request(AXProtocol::kMatch);
-  request[AXProtocol::kRules] =
-      value::Value::dictionary({{"QSExtensionIdentifier", value::Value::array(names)}});
-  request[AXProtocol::kFlags] = value::Value::unsignedInteger(flags);
-  auto pending = client.start(request);
-  auto reply = BlockingClient::await(pending);
-  const value::Value* body = reply ? std::get_if<value::Value>(&*reply) : nullptr;
-  const value::Value* matches =
-      body && body->asDictionary() ? body->asDictionary()->find(AXProtocol::kMatches) : nullptr;
-  std::optional<value::Value> list =
-      matches ? client.client().convertFromZyn(*matches) : std::nullopt;
-  std::vector<std::string> found;
-  if (!list || !list->asArray()) return {"no matches: " + BlockingClient::describe(reply)};
-  for (const value::Value& form : *list->asArray()) {
-    found.push_back(*form.asDictionary()->find("identifier")->asString());
-  }
-  return found;
-}
-
-TEST_F(AXDServerHoldTest, DiscoveryLeavesOutAHeldPlugInUnlessAManagerDiscoversAll) {
-  auto held = plugIn("hold.hidden");
-  plugIn("hold.open");
-  const std::string grants =
-      InProcessServer::shared().root() + "/etc/annexa/entitlements.d/0-holds.plist";
-  std::filesystem::create_directories(std::filesystem::path(grants).parent_path());
-  std::ofstream(grants)
-      << value::PropertyList::toXml(
-             value::Value::dictionary(
-                 {{"Executable",
-                   value::Value::string(std::filesystem::canonical("/proc/self/exe"))},
-                  {"Entitlements", value::Value::dictionary({{AXDNames::kManagerEntitlement,
-                                                              value::Value::boolean(true)}})}}))
-             .value();
-  std::filesystem::permissions(grants, std::filesystem::perms(0644));
-  BlockingClient client(InProcessServer::kServiceName);
-  const std::vector<std::string> both = {"hold.hidden", "hold.open"};
-
-  auto placed = hold({held});
-  EXPECT_EQ(discovered(client, both, 0), std::vector<std::string>{"hold.open"});
-  EXPECT_EQ(discovered(client, both, AXProtocol::AXDiscoverAll), both);
-  server_->unholdToken(placed->uuid());
-  EXPECT_EQ(discovered(client, both, 0), both);
-  std::filesystem::remove(grants);
 }
 
 }  // namespace

@@ -61,12 +61,6 @@ class AXDServerTest : public ::testing::Test {
   std::size_t since_ = 0;  // where this test's part of the log starts
 };
 
-TEST_F(AXDServerTest, TheClassServerIsTheOneInitForServiceBuilt) {
-  EXPECT_EQ(AXDServer::server(), server_);
-  EXPECT_EQ(server_->service()->path(),
-            daemon().root() + "/run/zyn/" + InProcessServer::kServiceName);
-}
-
 TEST_F(AXDServerTest, RequestsQueuedByAClientThatDiedAreDroppedUnanswered) {
   server_->setVerbose(1);
   std::vector<std::uint8_t> frames;

@@ -58,14 +58,17 @@ inline std::string writePlugIn(const std::string& bundle, const PlugInContents& 
   return bundle;
 }
 
-// "<directory>/<app>.app/PlugIns/<id>.appex": a well-formed plug-in with identifier |id|, inside
-// an application of that name; returns the plug-in's path.
+// "<directory>/<app>.app/PlugIns/<id>.appex": the plug-in that |contents| describes, inside the
+// application "<app>.app", which is made with identifier "app.<app>" when missing; returns the
+// plug-in's path.
 inline std::string plugIn(const std::string& directory, const std::string& app,
-                          const std::string& id) {
+                          const PlugInContents& contents) {
   using value::Value;
-  writePlist(directory + "/" + app + ".app/Info.plist",
-             Value::dictionary({{"QFBundleIdentifier", Value::string("app." + app)}}));
-  return writePlugIn(directory + "/" + app + ".app/PlugIns/" + id + ".appex", {.id = id});
+  const std::string info = directory + "/" + app + ".app/Info.plist";
+  if (!std::filesystem::exists(info)) {
+    writePlist(info, Value::dictionary({{"QFBundleIdentifier", Value::string("app." + app)}}));
+  }
+  return writePlugIn(directory + "/" + app + ".app/PlugIns/" + contents.id + ".appex", contents);
 }
 
 // Makes |app| (a ".app" directory) an application whose executable is a copy of |program|, so
@@ -94,11 +97,6 @@ inline void grantProgram(const std::string& root, const std::string& name,
                  {"Entitlements", Value::dictionary(entitlements)},
              }));
   std::filesystem::permissions(file, std::filesystem::perms(0644));
-}
-
-// Grants the running test program |entitlements| in the entitlement table of device |root|.
-inline void grantThisProgram(const std::string& root, const value::Dictionary& entitlements) {
-  grantProgram(root, "e2e_tests", "/proc/self/exe", entitlements);
 }
 
 }  // namespace bundles

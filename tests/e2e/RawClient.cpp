@@ -1,6 +1,5 @@
 #include "tests/e2e/RawClient.h"
 
-#include <poll.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <unistd.h>
@@ -27,6 +26,8 @@ os::Result<std::unique_ptr<RawClient>> RawClient::connect(const std::string& pat
   std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
   int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
   if (fd < 0) return os::Error::fromErrno("socket");
+  timeval wait{kTimeout.count(), 0};
+  setsockopt(fd, SOL_SOCKET, SO_RCVTIMEO, &wait, sizeof wait);
   if (::connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
     os::Error error = os::Error::fromErrno("connect " + path);
     close(fd);
@@ -63,51 +64,36 @@ bool RawClient::sendFrame(zyn::FrameKind kind, std::uint64_t id, const Value& bo
   return send(bytes);
 }
 
-std::optional<zyn::Frame> RawClient::readFrame(std::chrono::milliseconds timeout) {
-  const auto deadline = std::chrono::steady_clock::now() + timeout;
-  for (;;) {
-    auto next = decoder_.next();
-    if (!next.ok()) return std::nullopt;
-    if (next.value()) return std::move(*next.value());
-    auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
-        deadline - std::chrono::steady_clock::now());
-    if (left.count() <= 0 || !fill(left)) return std::nullopt;
-  }
-}
-
 std::string RawClient::request(std::uint64_t id, const Value& body) {
   if (!sendFrame(zyn::FrameKind::Request, id, body)) return "cannot send";
-  std::optional<zyn::Frame> reply = readFrame();
-  if (!reply || reply->kind != zyn::FrameKind::Reply || reply->id != id) return "no reply";
-  return BlockingClient::describe(zyn::ReplyOrError(reply->body));
+  for (;;) {
+    auto next = decoder_.next();
+    if (!next.ok()) return "no reply";
+    if (const auto& reply = next.value()) {
+      if (reply->kind != zyn::FrameKind::Reply || reply->id != id) return "no reply";
+      return BlockingClient::describe(zyn::ReplyOrError(reply->body));
+    }
+    if (!fill()) return "no reply";
+  }
 }
 
-bool RawClient::closedByPeer(std::chrono::milliseconds timeout) {
-  const auto deadline = std::chrono::steady_clock::now() + timeout;
+bool RawClient::closedByPeer() {
   // Whatever the daemon sends before closing stays unread in the decoder.
-  while (!ended_) {
-    auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
-        deadline - std::chrono::steady_clock::now());
-    if (left.count() <= 0) return false;
-    fill(left);
+  while (fill()) {
   }
-  return true;
+  return ended_;
 }
 
-bool RawClient::fill(std::chrono::milliseconds timeout) {
-  if (ended_) return false;
-  pollfd readable{fd_, POLLIN, 0};
-  int ready = poll(&readable, 1, static_cast<int>(timeout.count()));
-  if (ready < 0 && errno == EINTR) return true;
-  if (ready <= 0) return false;
+bool RawClient::fill() {
   std::uint8_t* space = decoder_.prepare(kReadChunk);
-  ssize_t n = recv(fd_, space, kReadChunk, 0);
-  if (n < 0 && errno == EINTR) return true;
-  if (n <= 0) {
-    // The end of the stream; a reset (the daemon closed with our bytes unread) is one too.
-    ended_ = true;
-    return false;
+  ssize_t n = 0;
+  do n = recv(fd_, space, kReadChunk, 0);
+  while (n < 0 && errno == EINTR);
+  if (n > 0) {
+    decoder_.commit(static_cast<std::size_t>(n));
+    return true;
   }
-  decoder_.commit(static_cast<std::size_t>(n));
-  return true;
+  // The end of the stream; a reset (the daemon closed with our bytes unread) is one too.
+  ended_ = n == 0 || (errno != EAGAIN && errno != EWOULDBLOCK);
+  return false;
 }

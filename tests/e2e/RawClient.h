@@ -3,7 +3,6 @@
 #include <chrono>
 #include <cstdint>
 #include <memory>
-#include <optional>
 #include <span>
 #include <string>
 
@@ -12,7 +11,7 @@
 #include "platform/zyn/Frame.h"
 
 // A bare stream connection to a daemon's socket, for the bytes and frames that the client
-// library never sends. Every read waits at most the time it is given. Not thread-safe.
+// library never sends. Every read waits at most kTimeout. Not thread-safe.
 class RawClient {
  public:
   // Long enough for a loaded machine under sanitizers; only a silent daemon reaches it.
@@ -32,22 +31,19 @@ class RawClient {
   // Encodes the frame and writes it.
   bool sendFrame(zyn::FrameKind kind, std::uint64_t id, const value::Value& body);
 
-  // The next frame from the daemon; nothing when none came within |timeout| or the stream
-  // ended, broke or held a bad frame.
-  std::optional<zyn::Frame> readFrame(std::chrono::milliseconds timeout = kTimeout);
   // Sends |body| as request |id| and describes the next frame as BlockingClient::describe()
-  // does when it is the reply to |id|; "no reply" when it is another frame or none came.
+  // does when it is the reply to |id|; "no reply" when it is another frame, a bad one or none
+  // came.
   std::string request(std::uint64_t id, const value::Value& body);
-  // True when the daemon closed the connection within |timeout|. Frames that come first are
-  // read and dropped.
-  bool closedByPeer(std::chrono::milliseconds timeout = kTimeout);
+  // True when the daemon closed the connection. Frames that come first are read and dropped.
+  bool closedByPeer();
 
  private:
   explicit RawClient(int fd) : fd_(fd) {}
 
-  // Reads what the socket has within |timeout| into the decoder; false at the end of the
-  // stream, on an error or on timeout.
-  bool fill(std::chrono::milliseconds timeout);
+  // Reads what the socket has into the decoder; false at the end of the stream (then ended_ is
+  // set), on an error or on timeout.
+  bool fill();
 
   int fd_;
   bool ended_ = false;

@@ -1,118 +1,153 @@
-// Registration through the real daemon: add, remove, and the registry's notices of changes that
-// another process makes.
+// Registration and elections through the real daemon: add, remove, annotate into the file that
+// -d names, and the notices that cross processes: the registry's of an uninstall, and the
+// annotation change that axctl watch follows. The annotation file itself is tested in-process.
 
-#include <chrono>
+#include <algorithm>
+#include <filesystem>
+#include <future>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "Annexa/AXProtocol.h"
-#include "platform/launcher/ServiceLauncher.h"
 #include "platform/registrum/Workspace.h"
+#include "platform/value/PropertyList.h"
 #include "tests/e2e/Bundles.h"
 #include "tests/e2e/DaemonTest.h"
-#include "tests/support/BlockingClient.h"
+#include "tests/platform/TempDirectory.h"
 
 namespace {
 
+using value::Dictionary;
 using value::Value;
 
 const std::string kManager = AXD_VENDOR_PREFIX ".private.annexa.manager";
+const std::string kAnnotationChange = AXD_VENDOR_PREFIX ".annexa.annotation-change";
 
 class RegistrationTest : public DaemonTest {
  protected:
-  void SetUp() override {
-    ASSERT_TRUE(start());
-    auto opened = registrum::Workspace::open(daemon().root());
-    ASSERT_TRUE(opened.ok());
-    registry_ = opened.value();
-    client_ = std::make_unique<BlockingClient>();
-  }
-
-  std::string add(const std::vector<std::string>& paths) {
-    return client_->outcome(client_->client().request(AXProtocol::kAdd, paths));
-  }
-  std::string remove(const std::vector<std::string>& paths) {
-    return client_->outcome(client_->client().request(AXProtocol::kRemove, paths));
-  }
-  bool registered(const std::string& path) {
-    auto record = registry_->plugInAtPath(path);
-    return record.ok() && record.value();
-  }
+  // Writes plug-in |id| into the application |app|; returns its path.
   std::string bundle(const std::string& app, const std::string& id) {
-    return bundles::plugIn(daemon().root() + "/Applications", app, id);
+    return bundles::plugIn(root() + "/Applications", app, {.id = id});
   }
-
-  std::shared_ptr<registrum::Workspace> registry_;
-  std::unique_ptr<BlockingClient> client_;
+  // Registers plug-in |id| through the daemon and returns its UUID.
+  value::Uuid install(const std::string& id) {
+    std::string path = bundle("Notes", id);
+    EXPECT_EQ(send(AXProtocol::kAdd, {path}), "ok");
+    return uuid(path);
+  }
+  std::string annotate(const std::vector<value::Uuid>& uuids, const Dictionary& annotations) {
+    auto request = client().client().request(AXProtocol::kAnnotate, uuids, 0);
+    request[AXProtocol::kAnnotations] = Value::dictionary(annotations);
+    return client().outcome(request);
+  }
+  TempDirectory home_;
+  std::string file_ = home_ / "Annotations";
 };
 
 TEST_F(RegistrationTest, AddStopsAtTheFirstBadPathAndKeepsWhatCameBefore) {
+  ASSERT_TRUE(start());
   std::string good = bundle("Notes", "add.good");
   std::string later = bundle("Notes", "add.later");
-  EXPECT_EQ(add({}), "ok");
-  EXPECT_EQ(add({good, "Notes.app/PlugIns/x.appex", later}),
+  EXPECT_EQ(send(AXProtocol::kAdd, {good, "Notes.app/PlugIns/x.appex", later}),
             "9: absolute path required: Notes.app/PlugIns/x.appex");
-  EXPECT_TRUE(registered(good));
-  EXPECT_FALSE(registered(later));
+  EXPECT_TRUE(record(good));
+  EXPECT_FALSE(record(later));
 
-  EXPECT_EQ(add({daemon().root() + "/missing.appex"}),
-            "9: invalid plugin path: " + daemon().root() + "/missing.appex");
-  std::string empty = daemon().root() + "/Empty.appex";
+  EXPECT_EQ(send(AXProtocol::kAdd, {root() + "/missing.appex"}),
+            "9: invalid plugin path: " + root() + "/missing.appex");
+  std::string empty = root() + "/Empty.appex";
   std::filesystem::create_directories(empty);
-  EXPECT_EQ(add({empty}), "2: unable to register plug-in at " + empty);
-  EXPECT_EQ(logCount("failed to register plug-in at " + empty), 1u);
+  EXPECT_EQ(send(AXProtocol::kAdd, {empty}), "2: unable to register plug-in at " + empty);
+  auto request = client().client().request(AXProtocol::kAdd);
+  request[AXProtocol::kPaths] = Value::string(good);
+  EXPECT_EQ(client().outcome(request), "4: invalid request format");
 
   // A symbolic link is registered as the bundle it resolves to.
-  std::string link = daemon().root() + "/link.appex";
+  std::string link = root() + "/link.appex";
   std::filesystem::create_directory_symlink(later, link);
-  EXPECT_EQ(add({link}), "ok");
-  EXPECT_TRUE(registered(later));
-}
-
-TEST_F(RegistrationTest, MalformedPathListsAreRefused) {
-  auto request = client_->client().request(AXProtocol::kAdd);
-  request[AXProtocol::kPaths] = Value::string("/a/b.appex");
-  EXPECT_EQ(client_->outcome(request), "4: invalid request format");
-  request[AXProtocol::kPaths] = Value::array({Value::integer(1)});
-  EXPECT_EQ(client_->outcome(request), "4: invalid request format");
-  request.erase(AXProtocol::kPaths);
-  EXPECT_EQ(client_->outcome(request), "4: invalid request format");
+  EXPECT_EQ(send(AXProtocol::kAdd, {link}), "ok");
+  EXPECT_TRUE(record(later));
 }
 
 TEST_F(RegistrationTest, RemoveNeedsTheManagerEntitlement) {
+  ASSERT_TRUE(start());
   std::string path = bundle("Notes", "remove.me");
-  ASSERT_EQ(add({path}), "ok");
-  EXPECT_EQ(remove({"/does/not/exist.appex"}), "11: caller lacks entitlement for this operation");
-  EXPECT_TRUE(logHasLineWith({"refused request from pid=" + std::to_string(getpid()),
-                              "/does/not/exist.appex - client lacks required entitlement"}));
+  ASSERT_EQ(send(AXProtocol::kAdd, {path}), "ok");
+  EXPECT_EQ(send(AXProtocol::kRemove, {path}), "11: caller lacks entitlement for this operation");
+  EXPECT_TRUE(record(path));
 
-  bundles::grantThisProgram(daemon().root(), {{kManager, Value::boolean(true)}});
-  client_ = std::make_unique<BlockingClient>();  // entitlements are read when a client connects
-  EXPECT_EQ(remove({path}), "ok");
-  EXPECT_FALSE(registered(path));
-  EXPECT_EQ(remove({"/does/not/exist.appex"}), "9: no plugin at /does/not/exist.appex");
+  grant({{kManager, Value::boolean(true)}});
+  EXPECT_EQ(send(AXProtocol::kRemove, {path}), "ok");
+  EXPECT_FALSE(record(path));
+  EXPECT_EQ(send(AXProtocol::kRemove, {"/does/not/exist.appex"}),
+            "9: no plugin at /does/not/exist.appex");
 }
 
-TEST_F(RegistrationTest, AnUninstallByAnotherProcessIsLoggedAndWithdrawsServices) {
-  std::string first = bundle("Widgets", "widget.one");
-  std::string second = bundle("Widgets", "widget.two");
-  ASSERT_EQ(add({first, second}), "ok");
-  ASSERT_TRUE(daemon().waitForLog("INSTALLED:widget.two widget.two(1.0)"));
-  ASSERT_TRUE(
-      launcher::ServiceLauncher::addService(getpid(), "widget.one", "1.0", "/bin/sh", {}).ok());
+// What the daemon does on an uninstall is tested in-process; here, that the registry's notice
+// reaches it from another process.
+TEST_F(RegistrationTest, AnUninstallByAnotherProcessReachesTheDaemon) {
+  ASSERT_TRUE(start());
+  ASSERT_EQ(send(AXProtocol::kAdd, {bundle("Widgets", "widget.one")}), "ok");
+  ASSERT_TRUE(daemon().waitForLog("INSTALLED:widget.one widget.one(1.0)"));
+  auto registry = registrum::Workspace::open(root());
+  ASSERT_TRUE(registry.ok());
+  ASSERT_TRUE(registry.value()->uninstallApplication(root() + "/Applications/Widgets.app").ok());
+  EXPECT_TRUE(daemon().waitForLog("UNINSTALLED:widget.one widget.one(1.0)"));
+}
 
-  ASSERT_TRUE(registry_->uninstallApplication(daemon().root() + "/Applications/Widgets.app").ok());
-  ASSERT_TRUE(daemon().waitForLog("UNINSTALLED:widget.two widget.two(1.0)"));
-  EXPECT_TRUE(logHasLineWith({"UNINSTALLED:widget.one widget.one(1.0)", first}));
-  // The withdrawal is not awaited by the notice; give the service queue its moment.
-  auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(10);
-  while (!launcher::ServiceLauncher::services().value().empty() &&
-         std::chrono::steady_clock::now() < deadline) {
-    std::this_thread::sleep_for(std::chrono::milliseconds(20));
+TEST_F(RegistrationTest, AnnotateChecksEveryFieldBeforeStoringAnything) {
+  ASSERT_TRUE(start({"-d", file_}));
+  value::Uuid first = install("annotate.first");
+  value::Uuid second = install("annotate.second");
+  EXPECT_EQ(annotate({first}, {{"election", Value::string("1")}}),
+            "4: invalid request format (annotation election)");
+  EXPECT_EQ(annotate({first}, {{"election", Value::integer(1)}, {"extension", Value::array({})}}),
+            "4: invalid request format (annotation extension)");
+  // Values the wire carries but the file cannot hold are refused like wrong types.
+  EXPECT_EQ(annotate({first}, {{"election", Value::unsignedInteger(UINT64_MAX)}}),
+            "4: invalid request format (annotation election)");
+  EXPECT_EQ(annotate({first}, {{"extension", Value::dictionary({{"id", Value::uuid(first)}})}}),
+            "4: invalid request format (annotation extension)");
+  EXPECT_EQ(annotate({}, {{"other", Value::integer(1)}}), "ok");
+  EXPECT_FALSE(std::filesystem::exists(file_));  // nothing stored, so nothing written
+
+  EXPECT_EQ(annotate({first, value::Uuid::random()}, {{"election", Value::integer(2)}}),
+            "4: no such plugin (uuid not found)");
+  const Dictionary extension{{"extension", Value::dictionary({})}};
+  EXPECT_EQ(annotate({second}, extension.with("other", Value::integer(1))), "ok");
+  auto written = value::PropertyList::readFile(file_);
+  ASSERT_TRUE(written.ok()) << written.error().message;
+  EXPECT_EQ(
+      written.value(),
+      Value::dictionary(
+          {{"version", Value::integer(16)},
+           {"data", Value::dictionary({
+                        {"annotate.first", Value::dictionary({{"election", Value::integer(2)}})},
+                        {"annotate.second", Value::dictionary(extension)},
+                    })}}));
+  // Discovery returns what was stored, and its rules read the election.
+  value::Array forms = match(Value::dictionary({{"QSUserElection", Value::string("2")}}));
+  ASSERT_EQ(forms.size(), 1u);
+  const Value* annotations = forms[0].asDictionary()->find("annotations");
+  EXPECT_EQ(annotations ? *annotations : Value(),
+            Value::dictionary({{"election", Value::integer(2)}}));
+}
+
+TEST_F(RegistrationTest, WatchSeesTheChanges) {
+  ASSERT_TRUE(start());
+  value::Uuid uuid = install("watched");
+  auto watch = std::async(std::launch::async, [&] {
+    return axctl({"watch", kAnnotationChange, "--count", "3"});
+  });
+  // The watcher reports only changes after it started, so change until it has seen three.
+  for (int i = 0;
+       i < 500 && watch.wait_for(std::chrono::milliseconds(20)) != std::future_status::ready; ++i) {
+    annotate({uuid}, {{"election", Value::integer(i % 3)}});
   }
-  EXPECT_TRUE(launcher::ServiceLauncher::services().value().empty());
-  EXPECT_EQ(logCount("PLUGIN REMOVAL:"), 0u);
+  Subprocess::Outcome outcome = watch.get();
+  EXPECT_EQ(outcome.status, 0) << outcome.err;
+  EXPECT_EQ(std::count(outcome.out.begin(), outcome.out.end(), '\n'), 3);
+  EXPECT_EQ(outcome.out.rfind(kAnnotationChange + " ", 0), 0u);
 }
 
 }  // namespace

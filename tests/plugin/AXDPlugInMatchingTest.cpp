@@ -70,7 +70,6 @@ TEST_F(AXDPlugInMatchingTest, KeysNameTheirValues) {
   } cases[] = {
       {"QSExtensionIdentifier", S(kIdentifier), true},
       {"QSExtensionIdentifier", S("com.example.Tool"), false},
-      {"QSExtensionIdentifier", S("com.example"), false},
       {kUuidKey, S(kUuidText), true},
       {kUuidKey, S(lower), false},
       {"Missing", kTrue, false},
@@ -81,23 +80,18 @@ TEST_F(AXDPlugInMatchingTest, KeysNameTheirValues) {
       {"Count", kTrue, true},
       {"Count", S("3"), false},
       {"QSExtensionVersion", S(">=2.9"), true},
-      {"QSExtensionVersion", S("<>2.9"), true},
-      {"QSExtensionVersion", S("<2.9"), false},
       {"Kinds", S("beta"), true},
       {"Kinds", A({S("gamma"), S("alpha")}), true},
       {"Kinds", S("7"), false},
       {"InfoOnly", S("raw"), true},
-      {"Shadow", S("info"), false},
-      {"Shadow", S("attribute"), true},
+      {"Shadow", S("info"), false},  // the attribute hides the Info.plist key
       {"ENTITLEMENT:e.string", S("yes"), true},
       {"ENTITLEMENT:e.false", kFalse, true},
-      {"ENTITLEMENT:e.false", kTrue, false},
       {"ENTITLEMENT:Count", kTrue, false},
       {"ENTITLEMENT:", kFalse, true},
       {"QSExtensionContainingApp", S(app_), true},
       {"QSUserElection", S("0"), true},  // no server: never elected
       {"Rule", D({{"items", A({S("image/png"), S("image/svg+xml")})}}), true},
-      {"Rule", D({{"items", A({S("text/plain")})}}), false},
       {"QSExtensionVersion", D({{"items", A({S("image/png")})}}), false},
   };
   for (const auto& c : cases) {
@@ -134,40 +128,29 @@ TEST_F(AXDPlugInMatchingTest, OperatorsAreTriedLongestFirst) {
       {"2.10", ">2.9", true},
       {"2.10", "=2.10", true},
       {"2.10", "2.9", false},
-      {"10", ">9", true},
+      // These three would flip were the operators tried in another order.
       {"3", "<=2", false},
-      {"2", "<=2", true},
       {"3", ">=3", true},
       {"2", "<>2", false},
       {"<3", "=<3", true},
-      {"3", "=<3", false},
       {"", "", true},
       {"a", "<b", true},
       {"image/svg+xml", "?UT-CONFORMS:application/xml", true},
-      {"image/svg+xml", "?UT-CONFORMS:image/*", true},
       {"application/xml", "?UT-CONFORMS:image/svg+xml", false},
       {"application/xml", "?UT-IS:image/svg+xml", true},
-      {"image/svg+xml", "?UT-IS:application/xml", false},
+      {"?UT-IS", "?UT-IS", false},  // no operator without its colon
   };
+  LogCapture log;
   for (const auto& c : cases) {
     EXPECT_EQ(plugIn->matchValuePattern(c.value, c.pattern), c.expected)
         << c.value << " " << c.pattern;
   }
+  EXPECT_NE(log.text().find("unrecognized match operator:?UT-IS\n"), std::string::npos);
   const Value alternatives = A({S("1.0"), Value::integer(2), S(">=3")});
   EXPECT_TRUE(plugIn->matchValuePatterns("1.0", alternatives));
   EXPECT_TRUE(plugIn->matchValuePatterns("3.1", alternatives));
   EXPECT_FALSE(plugIn->matchValuePatterns("2", alternatives));
   EXPECT_FALSE(plugIn->matchValuePatterns("2", A({})));
-}
-
-TEST_F(AXDPlugInMatchingTest, AnUnknownQueryOperatorNeverMatchesAndIsLogged) {
-  auto plugIn = record({{"Query", S("?FOO:x")}});
-  LogCapture log;
-  EXPECT_FALSE(plugIn->matchKey("Query", S("?FOO:x")));
-  EXPECT_FALSE(plugIn->matchValuePattern("?UT-IS", "?UT-IS"));
-  EXPECT_NE(log.text().find("unrecognized match operator:?FOO:x\n"), std::string::npos)
-      << log.text();
-  EXPECT_NE(log.text().find("unrecognized match operator:?UT-IS\n"), std::string::npos);
 }
 
 TEST_F(AXDPlugInMatchingTest, EveryPatternKindMeetsEveryValueKind) {

@@ -26,12 +26,11 @@ class AXSandboxExtensionTest : public DeviceRootTest {
   std::size_t held_ = 0;
 };
 
-// One grant per object, however often it is consumed, held until the object goes.
-TEST_F(AXSandboxExtensionTest, ConsumingTwiceConsumesOnceAndDestructionExpels) {
+// One grant per object, however often it is consumed, held until expelled or destroyed.
+TEST_F(AXSandboxExtensionTest, HoldsOneGrantFromItsFirstGoodConsumeUntilExpelledOrDestroyed) {
   std::int64_t handle = 0;
   {
     AXSandboxExtension extension(token_);
-    EXPECT_EQ(extension.handle(), 0);
     ASSERT_TRUE(extension.consume().ok());
     handle = extension.handle();
     EXPECT_NE(handle, 0);
@@ -44,31 +43,25 @@ TEST_F(AXSandboxExtensionTest, ConsumingTwiceConsumesOnceAndDestructionExpels) {
     EXPECT_TRUE(GrantTable::shared().find(handle));
   }
   EXPECT_FALSE(GrantTable::shared().find(handle));
-  EXPECT_EQ(GrantTable::shared().size(), held_);
-}
 
-TEST_F(AXSandboxExtensionTest, ExpelReleasesTheGrantAndDropsEvenAnUnknownHandle) {
-  AXSandboxExtension extension(token_);
-  ASSERT_TRUE(extension.consume().ok());
-  extension.expel();
-  EXPECT_EQ(extension.handle(), 0);
+  AXSandboxExtension expelled(token_);
+  ASSERT_TRUE(expelled.consume().ok());
+  expelled.expel();
+  EXPECT_EQ(expelled.handle(), 0);
   EXPECT_EQ(GrantTable::shared().size(), held_);
-  extension.setHandle(1 << 30);
-  extension.expel();
-  EXPECT_EQ(extension.handle(), 0);
-}
+  expelled.setHandle(1 << 30);  // an unknown handle is forgotten all the same
+  expelled.expel();
+  EXPECT_EQ(expelled.handle(), 0);
 
-TEST_F(AXSandboxExtensionTest, ARefusedTokenCountsAsNotConsumed) {
-  AXSandboxExtension extension("v1;not a token");
-  os::Status refused = extension.consume();
-  ASSERT_FALSE(refused.ok());
-  EXPECT_EQ(refused.error().errnum, EINVAL);
-  EXPECT_EQ(extension.handle(), 0);
-  EXPECT_EQ(GrantTable::shared().size(), held_);
-
-  extension.setToken(token_);
-  ASSERT_TRUE(extension.consume().ok());
-  EXPECT_NE(extension.handle(), 0);
+  // A refused token leaves the object unconsumed, ready for another.
+  AXSandboxExtension refused("v1;not a token");
+  os::Status status = refused.consume();
+  ASSERT_FALSE(status.ok());
+  EXPECT_EQ(status.error().errnum, EINVAL);
+  EXPECT_EQ(refused.handle(), 0);
+  refused.setToken(token_);
+  ASSERT_TRUE(refused.consume().ok());
+  EXPECT_NE(refused.handle(), 0);
 }
 
 }  // namespace
