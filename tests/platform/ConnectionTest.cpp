@@ -3,7 +3,6 @@
 #include <sys/un.h>
 #include <unistd.h>
 
-#include <condition_variable>
 #include <future>
 #include <mutex>
 
@@ -49,11 +48,6 @@ class Service {
     state_->onEvent = nullptr;
   }
 
-  std::shared_ptr<zyn::Connection> firstConnection() {
-    std::lock_guard lock(state_->mutex);
-    return state_->connections.empty() ? nullptr : state_->connections.front();
-  }
-
  private:
   struct State {
     std::mutex mutex;
@@ -97,37 +91,6 @@ TEST(ConnectionTest, RepliesReachTheRequestTheyAnswerWhateverTheirOrder) {
   EXPECT_EQ(*first.get_future().get().asDictionary()->find("echo"), Value::integer(1));
   EXPECT_EQ(*second.get_future().get().asDictionary()->find("echo"), Value::integer(2));
   client->cancel();
-}
-
-TEST(ConnectionTest, ThePeerIsKnownAndAGoodbyeArrivesBeforeTheEnd) {
-  std::mutex mutex;
-  std::condition_variable changed;
-  std::vector<zyn::ErrorKind> errors;
-  Service service([&](zyn::Connection&, const zyn::Event& event) {
-    if (const auto* error = std::get_if<zyn::ServiceError>(&event)) {
-      std::lock_guard lock(mutex);
-      errors.push_back(error->kind);
-      changed.notify_all();
-    }
-  });
-  auto client = zyn::Connection::toService("test.zyn", std::make_shared<zyn::StrandQueue>("c"));
-  client->resume();
-  client->sendMessage(numbered(0));
-  std::shared_ptr<zyn::Connection> accepted;
-  for (int i = 0; i < 500 && !(accepted = service.firstConnection()); ++i) usleep(10000);
-  ASSERT_TRUE(accepted);
-  EXPECT_EQ(accepted->peerPid(), getpid());
-  EXPECT_GE(accepted->auditToken(), 0);
-  char self[4096];
-  ssize_t n = readlink("/proc/self/exe", self, sizeof self);
-  ASSERT_GT(n, 0);
-  EXPECT_EQ(accepted->peerExecutablePath(), std::string(self, static_cast<std::size_t>(n)));
-
-  client->cancel();
-  std::unique_lock lock(mutex);
-  ASSERT_TRUE(changed.wait_for(lock, std::chrono::seconds(10), [&] { return errors.size() == 2; }));
-  EXPECT_EQ(errors[0], zyn::ErrorKind::TerminationImminent);
-  EXPECT_EQ(errors[1], zyn::ErrorKind::ConnectionInvalid);
 }
 
 TEST(ConnectionTest, APeerThatDoesNotReadIsDisconnectedAtTheBacklogBound) {

@@ -35,14 +35,4 @@ TEST(PlistBridgeTest, MessageValuesBecomePropertyListValues) {
   EXPECT_FALSE(PlistBridge::toPlist(Value::envelope(Value())));
 }
 
-TEST(PlistBridgeTest, PropertyListValuesRoundTrip) {
-  Value plist = Value::dictionary({
-      {"a", Value::array({Value::integer(-1), Value::real(0.5), Value::boolean(true)})},
-      {"d", Value::dictionary({{"data", Value::data({1})}, {"date", Value::date({-3})}})},
-  });
-  Value message = PlistBridge::toMessage(plist);
-  EXPECT_EQ(message, plist);
-  EXPECT_EQ(PlistBridge::toPlist(message), plist);
-}
-
 }  // namespace

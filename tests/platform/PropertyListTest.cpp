@@ -1,10 +1,7 @@
 #include <gtest/gtest.h>
 #include <plist/plist.h>
-#include <unistd.h>
 
 #include <cerrno>
-#include <cstdlib>
-#include <fstream>
 #include <string>
 
 #include "platform/value/PropertyList.h"
@@ -14,6 +11,12 @@ namespace {
 using value::Dictionary;
 using value::PropertyList;
 using value::Value;
+
+// The error number of |result|, 0 when it succeeded.
+template <typename T>
+int errnumOf(const os::Result<T>& result) {
+  return result.ok() ? 0 : result.error().errnum;
+}
 
 std::span<const std::uint8_t> bytesOf(std::string_view text) {
   return {reinterpret_cast<const std::uint8_t*>(text.data()), text.size()};
@@ -74,30 +77,22 @@ std::vector<std::uint8_t> toBinary(plist_t root) {
   return bytes;
 }
 
-TEST(PropertyListTest, XmlReadsEveryType) {
+// What writing and reading back does not show: markup in comments, entities, and integers past
+// INT64_MAX, which read as their 64-bit pattern.
+TEST(PropertyListTest, XmlReadsWhatOthersWrite) {
   auto value = PropertyList::read(bytesOf(xmlPlist(R"(<dict>
-    <key>QFBundleIdentifier</key><string>org.annexa.demo</string>
     <key>count</key><integer>-5</integer>
     <key>big</key><integer>18446744073709551615</integer>
-    <key>ratio</key><real>0.5</real>
-    <key>on</key><true/>
-    <key>blob</key><data>AAEC</data>
-    <key>when</key><date>2001-01-01T00:00:10Z</date>
     <!-- a comment </dict> does not end anything -->
     <key>list</key><array><string>a &amp; b</string><dict/></array>
   </dict>)")));
   ASSERT_TRUE(value.ok()) << value.error().message;
-  Value expected = Value::dictionary({
-      {"QFBundleIdentifier", Value::string("org.annexa.demo")},
-      {"count", Value::integer(-5)},
-      {"big", Value::integer(-1)},
-      {"ratio", Value::real(0.5)},
-      {"on", Value::boolean(true)},
-      {"blob", Value::data({0, 1, 2})},
-      {"when", Value::date({978307210})},
-      {"list", Value::array({Value::string("a & b"), Value::dictionary({})})},
-  });
-  EXPECT_EQ(value.value(), expected);
+  EXPECT_EQ(value.value(),
+            Value::dictionary({
+                {"count", Value::integer(-5)},
+                {"big", Value::integer(-1)},
+                {"list", Value::array({Value::string("a & b"), Value::dictionary({})})},
+            }));
   EXPECT_EQ(value.value().asDictionary()->find("count")->type(), value::Type::Int);
 }
 
@@ -105,14 +100,11 @@ TEST(PropertyListTest, BinaryReadsWithDatesConverted) {
   plist_t root = plist_new_dict();
   plist_dict_set_item(root, "before", plist_new_date(-1, -500000));  // 1.5 s before 2001
   plist_dict_set_item(root, "after", plist_new_date(86400, 250000));
-  plist_dict_set_item(root, "n", plist_new_uint(7));
-  plist_dict_set_item(root, "s", plist_new_string("x"));
   auto value = PropertyList::read(toBinary(root));
   ASSERT_TRUE(value.ok()) << value.error().message;
   const Dictionary& d = *value.value().asDictionary();
   EXPECT_EQ(d.find("before")->asDate()->seconds, 978307198.5);
   EXPECT_EQ(d.find("after")->asDate()->seconds, 978393600.25);
-  EXPECT_EQ(*d.find("n"), Value::integer(7));
 }
 
 TEST(PropertyListTest, XmlTextReadsBackAsWritten) {
@@ -132,9 +124,7 @@ TEST(PropertyListTest, XmlTextReadsBackAsWritten) {
 
 TEST(PropertyListTest, ValuesWithoutPropertyListFormAreNotWritten) {
   const Value refused[] = {
-      Value(),
       Value::uuid(value::Uuid()),
-      Value::envelope(Value::integer(1)),
       Value::unsignedInteger(UINT64_MAX),
       Value::array({Value::string(std::string("a\0b", 3))}),
       Value::dictionary({{std::string("k\0", 2), Value::integer(1)}}),
@@ -142,11 +132,7 @@ TEST(PropertyListTest, ValuesWithoutPropertyListFormAreNotWritten) {
       Value::array({Value::dictionary({{"n", Value()}})}),
   };
   for (const Value& v : refused) {
-    auto xml = PropertyList::toXml(v);
-    EXPECT_FALSE(xml.ok()) << v.description();
-    if (!xml.ok()) {
-      EXPECT_EQ(xml.error().errnum, EINVAL);
-    }
+    EXPECT_EQ(errnumOf(PropertyList::toXml(v)), EINVAL) << v.description();
   }
 }
 
@@ -162,17 +148,11 @@ TEST(PropertyListTest, BrokenInputIsRefused) {
       binaryPlist({arrayOf({0})}),  // an array that contains itself
       binaryPlist({arrayOf({7})}),  // a reference past the objects
   };
-  for (const auto& bytes : inputs) {
-    auto value = PropertyList::read(bytes);
-    EXPECT_FALSE(value.ok());
-    if (!value.ok()) {
-      EXPECT_EQ(value.error().errnum, EINVAL) << value.error().message;
-    }
-  }
-  for (const char* xml : {"<dict><key>a</key></array>", "<array><string>a</array>", "plain"}) {
+  for (const auto& bytes : inputs) EXPECT_EQ(errnumOf(PropertyList::read(bytes)), EINVAL);
+  for (const char* xml :
+       {"<dict><key>a</key></array>", "plain", "<date>2100-01-01T00:00:00Z</date>"}) {
     EXPECT_FALSE(PropertyList::read(bytesOf(xmlPlist(xml))).ok()) << xml;
   }
-  EXPECT_FALSE(PropertyList::read(bytesOf(xmlPlist("<date>2100-01-01T00:00:00Z</date>"))).ok());
 }
 
 TEST(PropertyListTest, DepthIsLimitedInBothEncodings) {
@@ -191,9 +171,8 @@ TEST(PropertyListTest, DepthIsLimitedInBothEncodings) {
     return binaryPlist(objects);
   };
   EXPECT_TRUE(PropertyList::read(chain(128)).ok());
-  auto deeper = PropertyList::read(chain(129));
-  ASSERT_FALSE(deeper.ok());
-  EXPECT_NE(deeper.error().message.find("deeper than 128"), std::string::npos);
+  EXPECT_NE(PropertyList::read(chain(129)).error().message.find("deeper than 128"),
+            std::string::npos);
   EXPECT_FALSE(PropertyList::read(chain(200000)).ok());
 }
 
@@ -202,31 +181,14 @@ TEST(PropertyListTest, SharedObjectsCannotExpandWithoutBound) {
   std::vector<std::vector<std::uint8_t>> objects;
   for (std::uint32_t i = 1; i < 40; ++i) objects.push_back(arrayOf({i, i}));
   objects.push_back({0x51, 'x'});
-  auto value = PropertyList::read(binaryPlist(objects));
-  ASSERT_FALSE(value.ok());
-  EXPECT_NE(value.error().message.find("expands"), std::string::npos);
+  EXPECT_NE(PropertyList::read(binaryPlist(objects)).error().message.find("expands"),
+            std::string::npos);
 }
 
-TEST(PropertyListTest, FilesAreReadWithTheirPathInErrors) {
-  auto missing = PropertyList::readFile("/nonexistent/Info.plist");
-  ASSERT_FALSE(missing.ok());
-  EXPECT_EQ(missing.error().errnum, ENOENT);
-
-  std::string dir = ::testing::TempDir();
-  std::string good = dir + "/PropertyListTest-good.plist";
-  std::string bad = dir + "/PropertyListTest-bad.plist";
-  std::ofstream(good) << xmlPlist("<dict><key>k</key><integer>1</integer></dict>");
-  std::ofstream(bad) << xmlPlist("<dict><key>k</key>");
-  auto value = PropertyList::readFile(good);
-  ASSERT_TRUE(value.ok()) << value.error().message;
-  EXPECT_EQ(value.value(), Value::dictionary({{"k", Value::integer(1)}}));
-  auto broken = PropertyList::readFile(bad);
-  ASSERT_FALSE(broken.ok());
-  EXPECT_EQ(broken.error().errnum, EINVAL);
-  EXPECT_NE(broken.error().message.find(bad), std::string::npos);
-  EXPECT_EQ(PropertyList::readFile(dir).error().errnum, EISDIR);
-  ::unlink(good.c_str());
-  ::unlink(bad.c_str());
+// A malformed file names its path in the error, as WorkspaceTest sees with a broken Info.plist.
+TEST(PropertyListTest, UnreadableFilesFailWithTheSystemError) {
+  EXPECT_EQ(PropertyList::readFile("/nonexistent/Info.plist").error().errnum, ENOENT);
+  EXPECT_EQ(PropertyList::readFile(::testing::TempDir()).error().errnum, EISDIR);
 }
 
 }  // namespace

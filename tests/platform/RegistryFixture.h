@@ -1,7 +1,5 @@
 #pragma once
 
-#include <plist/plist.h>
-
 #include <filesystem>
 #include <fstream>
 #include <string>
@@ -16,26 +14,9 @@ class RegistryFixture {
   const std::string& root() const { return dir_.path(); }
   std::string operator/(const std::string& relative) const { return dir_ / relative; }
 
-  // Writes |plist| as XML (or binary) to |relative|, creating its directories; returns the path.
-  std::string writePlist(const std::string& relative, const value::Value& plist,
-                         bool binary = false) const {
-    std::string path = dir_ / relative;
-    std::filesystem::create_directories(std::filesystem::path(path).parent_path());
-    std::string xml = value::PropertyList::toXml(plist).value();
-    std::ofstream out(path, std::ios::binary | std::ios::trunc);
-    if (!binary) {
-      out << xml;
-      return path;
-    }
-    plist_t node = nullptr;
-    plist_from_xml(xml.data(), static_cast<uint32_t>(xml.size()), &node);
-    char* bytes = nullptr;
-    uint32_t length = 0;
-    plist_to_bin(node, &bytes, &length);
-    out.write(bytes, length);
-    plist_to_bin_free(bytes);
-    plist_free(node);
-    return path;
+  // Writes |plist| as XML to |relative|, creating its directories; returns the path.
+  std::string writePlist(const std::string& relative, const value::Value& plist) const {
+    return writeFile(relative, value::PropertyList::toXml(plist).value());
   }
 
   // Writes raw |contents| to |relative|, creating its directories; returns the path.
@@ -49,7 +30,7 @@ class RegistryFixture {
   // A plug-in bundle at |relative| with identifier |id| serving |point|; returns its path.
   std::string plugIn(const std::string& relative, const std::string& id,
                      const std::string& point = "com.example.point",
-                     value::Dictionary extraPlugIn = {}, bool binary = false) const {
+                     value::Dictionary extraPlugIn = {}) const {
     value::Dictionary plugInDictionary =
         extraPlugIn.with("QSExtensionPointIdentifier", value::Value::string(point));
     value::Dictionary info{{"QFBundleIdentifier", value::Value::string(id)},
@@ -57,7 +38,7 @@ class RegistryFixture {
                            {"QFBundleName", value::Value::string("Short")},
                            {"QFBundleDisplayName", value::Value::string("Display")},
                            {"QSExtension", value::Value::dictionary(plugInDictionary)}};
-    writePlist(relative + "/Info.plist", value::Value::dictionary(info), binary);
+    writePlist(relative + "/Info.plist", value::Value::dictionary(info));
     return dir_ / relative;
   }
 

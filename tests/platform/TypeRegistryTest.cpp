@@ -1,9 +1,7 @@
 #include <gtest/gtest.h>
 
-#include <atomic>
 #include <filesystem>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "platform/types/ActivationRule.h"
@@ -44,48 +42,27 @@ TEST_F(TypeRegistryTest, Conformance) {
     const char* to;
     bool expected;
   } cases[] = {
-      {"image/png", "image/png", true},
       {"IMAGE/PNG", "image/Png", true},
-      {"garbage", "GARBAGE", true},
-      {"", "", true},
-      {"", "text/plain", false},
-      {"text", "text/*", false},
+      {"text", "text/*", false},  // no concrete type
       {"text/plain; charset=utf-8", "text/plain", false},
-      {"image/png ", "image/*", false},
       {"a/b/c", "a/*", false},
-      {"image/png", "", false},
-      {"image/png", "*/*", false},
       {"image/*", "image/png", false},
-      {"text/x-foo", "text/plain", true},
+      {"image/png", "*/*", false},         // no target
+      {"text/x-foo", "text/plain", true},  // built in
       {"text/plain", "text/x-foo", false},
       {"image/png", "application/octet-stream", true},
-      {"image/png", "application/*", true},
-      {"image/svg+xml", "text/plain", true},  // two steps through the file, then built in
-      {"image/svg+xml", "TEXT/*", true},
+      {"image/svg+xml", "TEXT/*", true},  // two steps through the file, then built in
       {"image/svg+xml", "audio/*", false},
-      {"application/xml", "image/svg+xml", false},
-      {"image/jpg", "image/jpeg", true},
       {"image/jpeg", "IMAGE/JPG", true},
       {"text/xml", "text/plain", true},
       {"text/x-chdr", "text/x-csrc", true},  // the parent in the file is an alias
-      {"x-loop/a", "x-loop/b", true},
       {"x-loop/a", "image/png", false},
-      {"x-loop/c", "x-loop/d", false},
       {"image/x-portable-bitmap", "image/x-portable-anymap", true},
       {"inode/x-late", "image/*", true},  // malformed lines are skipped, not fatal
   };
   for (const Case& c : cases) {
     EXPECT_EQ(TypeRegistry::conforms(c.type, c.to), c.expected) << c.type << " -> " << c.to;
   }
-}
-
-TEST_F(TypeRegistryTest, EachRootHasItsOwnDatabaseAndMissingFilesAreEmpty) {
-  ASSERT_TRUE(TypeRegistry::conforms("image/svg+xml", "application/xml"));
-  TempDirectory bare;
-  environment_.set("ANNEXA_ROOT", bare.path());
-  EXPECT_FALSE(TypeRegistry::conforms("image/svg+xml", "application/xml"));
-  EXPECT_FALSE(TypeRegistry::conforms("image/jpg", "image/jpeg"));
-  EXPECT_TRUE(TypeRegistry::conforms("text/x-csrc", "text/plain"));
 }
 
 TEST_F(TypeRegistryTest, CacheRereadsAChangedFileOnlyAfterItsInterval) {
@@ -97,22 +74,8 @@ TEST_F(TypeRegistryTest, CacheRereadsAChangedFileOnlyAfterItsInterval) {
   root_.write("usr/share/mime/subclasses", "image/svg+xml application/xml\nimage/svg+xml x/y\n");
   EXPECT_EQ(eager.databaseFor(directory)->parents("image/svg+xml").size(), 2u);
   EXPECT_EQ(lazy.databaseFor(directory)->parents("image/svg+xml").size(), 1u);
-  std::filesystem::remove(root_ / "usr/share/mime/aliases");
+  std::filesystem::remove(root_ / "usr/share/mime/aliases");  // a missing file is empty
   EXPECT_EQ(eager.databaseFor(directory)->canonical("image/jpg"), "image/jpg");
-}
-
-TEST_F(TypeRegistryTest, ConcurrentCallersShareOneDatabase) {
-  std::atomic<int> wrong{0};
-  std::vector<std::thread> threads;
-  for (int t = 0; t < 4; ++t) {
-    threads.emplace_back([&wrong] {
-      for (int i = 0; i < 200; ++i) {
-        if (!TypeRegistry::conforms("image/svg+xml", "text/*")) ++wrong;
-      }
-    });
-  }
-  for (std::thread& thread : threads) thread.join();
-  EXPECT_EQ(wrong.load(), 0);
 }
 
 Value rule(std::initializer_list<value::Dictionary::Entry> entries) {
@@ -137,21 +100,17 @@ TEST_F(TypeRegistryTest, ActivationRules) {
       {rule({{"image/*", two}}), {}, false},
       {rule({{"image/*", any}}), {"image/a", "image/b", "image/c", "image/d"}, true},
       {rule({{"image/*", any}, {"MaxItems", two}}), {"image/a", "image/b", "image/c"}, false},
+      // An item counts against every limit it conforms to.
       {rule({{"image/*", one}, {"text/plain", one}}), {"image/png", "image/svg+xml"}, false},
       {rule({{"image/*", one}, {"text/plain", one}}), {"image/png", "text/x-csrc"}, true},
       {rule({{"image/*", one}, {"text/plain", one}}), {"image/png", "audio/ogg"}, false},
       {rule({{"image/png", one}}), {"IMAGE/PNG", "image/png"}, false},
       {rule({{"image/png", Value::unsignedInteger(2)}}), {"IMAGE/PNG", "image/png"}, true},
       {rule({{"image/png", Value::integer(0)}}), {"image/png"}, false},
-      {rule({{"image/png", Value::integer(-1)}}), {"image/png"}, false},
       {rule({{"image/png", Value::real(1.0)}}), {"image/png"}, false},
-      {rule({{"image/png", Value::boolean(false)}}), {"image/png"}, false},
-      {rule({{"image/png", Value::string("1")}}), {"image/png"}, false},
       {rule({{"image/png", one}, {"MaxItems", any}}), {"image/png"}, false},
-      {rule({{"image/png", one}, {"MaxItems", Value::integer(0)}}), {"image/png"}, false},
       {rule({{"MaxItems", one}}), {"image/png"}, false},
       {Value::array({}), {"image/png"}, false},
-      {Value(), {"image/png"}, false},
   };
   for (std::size_t i = 0; i < std::size(cases); ++i) {
     EXPECT_EQ(ActivationRule::evaluate(cases[i].rule, items(cases[i].items)), cases[i].expected)
