@@ -4,15 +4,20 @@
 
 namespace runtime {
 
-void Protocol::addProtocol(std::shared_ptr<const Protocol> adopted) {
-  if (!adopted || adopted.get() == this) return;
-  if (std::find(adopted_.begin(), adopted_.end(), adopted) != adopted_.end()) return;
-  adopted_.push_back(std::move(adopted));
+bool Protocol::addProtocol(std::shared_ptr<const Protocol> adopted) {
+  if (isRegistered() || !adopted || !adopted->isRegistered()) return false;
+  if (std::find(adopted_.begin(), adopted_.end(), adopted) == adopted_.end()) {
+    adopted_.push_back(std::move(adopted));
+  }
+  return true;
 }
 
-void Protocol::addSelector(std::string selector) {
-  if (std::find(selectors_.begin(), selectors_.end(), selector) != selectors_.end()) return;
-  selectors_.push_back(std::move(selector));
+bool Protocol::addSelector(std::string selector) {
+  if (isRegistered()) return false;
+  if (std::find(selectors_.begin(), selectors_.end(), selector) == selectors_.end()) {
+    selectors_.push_back(std::move(selector));
+  }
+  return true;
 }
 
 bool Protocol::conformsTo(const Protocol& other) const {

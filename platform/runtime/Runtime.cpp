@@ -50,7 +50,9 @@ std::shared_ptr<Protocol> Runtime::allocateProtocol(std::string name) const {
 std::shared_ptr<const Protocol> Runtime::registerProtocol(std::shared_ptr<Protocol> protocol) {
   std::string name = protocol->name();
   std::unique_lock guard(lock_);
-  return protocols_.try_emplace(std::move(name), std::move(protocol)).first->second;
+  auto [entry, inserted] = protocols_.try_emplace(std::move(name), protocol);
+  if (inserted) protocol->registered_.store(true, std::memory_order_release);
+  return entry->second;
 }
 
 std::shared_ptr<const Protocol> Runtime::addProtocol(

@@ -36,9 +36,9 @@ class Runtime {
   // a protocol of that name is registered. Allocation reserves nothing: two threads may each
   // allocate the same name, and registration decides between them.
   std::shared_ptr<Protocol> allocateProtocol(std::string name) const;
-  // Registers |protocol| (from allocateProtocol; the caller changes it no more) and returns the
-  // protocol now registered under its name: |protocol| itself, or the one another thread
-  // registered first, so every caller ends up with the same protocol.
+  // Registers |protocol| (from allocateProtocol) and returns the protocol now registered under
+  // its name: |protocol| itself, from then on unchangeable, or the one another thread registered
+  // first, so every caller ends up with the same protocol.
   std::shared_ptr<const Protocol> registerProtocol(std::shared_ptr<Protocol> protocol);
 
   // Registers, in one line of the program that defines it, the protocol |name| adopting the

@@ -43,6 +43,21 @@ TEST(ObjectRuntime, RegistrationKeepsTheFirstOfEachName) {
   EXPECT_EQ(rt.lookUpClass("string"), nullptr);
 }
 
+TEST(ObjectRuntime, ARegisteredProtocolNoLongerChangesAndOnlyRegisteredOnesAreAdopted) {
+  Runtime rt;
+  auto first = rt.allocateProtocol("First");
+  auto second = rt.allocateProtocol("Second");
+  // Two new protocols adopting each other would make a cycle that conformance never leaves.
+  EXPECT_FALSE(first->addProtocol(second));
+  EXPECT_TRUE(first->addSelector("a"));
+  auto registered = rt.registerProtocol(first);
+  EXPECT_TRUE(second->addProtocol(registered));
+  EXPECT_FALSE(first->addSelector("b"));
+  EXPECT_FALSE(first->addProtocol(rt.registerProtocol(second)));
+  EXPECT_FALSE(registered->declares("b"));
+  EXPECT_TRUE(rt.lookUpProtocol("Second")->conformsTo(*registered));
+}
+
 TEST(ObjectRuntime, UnregisteredProtocolsAreNotFoundAndDoNotReserveTheirName) {
   Runtime rt;
   auto a = rt.allocateProtocol("Q");
