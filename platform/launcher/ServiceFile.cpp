@@ -11,13 +11,16 @@ namespace {
 
 constexpr char kExecutable[] = "Executable";
 constexpr char kDescription[] = "Description";
+constexpr char kHostStartTime[] = "HostStartTime";
 
 }  // namespace
 
 os::Result<std::string> ServiceFile::encode(const Contents& contents) {
-  return value::PropertyList::toXml(
-      value::Value::dictionary({{kExecutable, value::Value::string(contents.executablePath)},
-                                {kDescription, value::Value::dictionary(contents.description)}}));
+  return value::PropertyList::toXml(value::Value::dictionary(
+      {{kExecutable, value::Value::string(contents.executablePath)},
+       {kDescription, value::Value::dictionary(contents.description)},
+       {kHostStartTime,
+        value::Value::integer(static_cast<std::int64_t>(contents.hostStartTime))}}));
 }
 
 os::Result<ServiceFile::Contents> ServiceFile::read(const std::string& path) {
@@ -26,10 +29,14 @@ os::Result<ServiceFile::Contents> ServiceFile::read(const std::string& path) {
   const value::Dictionary* file = read.value().asDictionary();
   const value::Value* executable = file ? file->find(kExecutable) : nullptr;
   const value::Value* description = file ? file->find(kDescription) : nullptr;
-  if (!executable || !executable->asString() || !description || !description->asDictionary()) {
+  const value::Value* started = file ? file->find(kHostStartTime) : nullptr;
+  std::int64_t startTime = started ? started->asInt().value_or(-1) : -1;
+  if (!executable || !executable->asString() || !description || !description->asDictionary() ||
+      startTime < 0) {
     return os::Error{EINVAL, path + ": not a service file"};
   }
-  return Contents{*executable->asString(), *description->asDictionary()};
+  return Contents{*executable->asString(), *description->asDictionary(),
+                  static_cast<std::uint64_t>(startTime)};
 }
 
 }  // namespace launcher

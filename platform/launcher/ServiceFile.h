@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <string>
 
 #include "platform/os/Error.h"
@@ -8,13 +9,15 @@
 namespace launcher {
 
 // The contents of one service file of the launcher's table: an XML property list
-//   {"Executable": <absolute path of the plug-in's executable>, "Description": <dictionary>}
+//   {"Executable": <absolute path of the plug-in's executable>, "Description": <dictionary>,
+//    "HostStartTime": <when the host process started (os::Process::startTime)>}
 // Stateless; safe to call from any thread.
 class ServiceFile {
  public:
   struct Contents {
     std::string executablePath;
     value::Dictionary description;
+    std::uint64_t hostStartTime = 0;
   };
 
   // |contents| as the text of a service file. Fails with EINVAL when a property list cannot
@@ -22,8 +25,8 @@ class ServiceFile {
   static os::Result<std::string> encode(const Contents& contents);
 
   // The service file at |path|. Fails with the errno of reading it (ENOENT when it is missing),
-  // or EINVAL when it is not a property list or lacks a string "Executable" or a dictionary
-  // "Description".
+  // or EINVAL when it is not a property list or lacks a string "Executable", a dictionary
+  // "Description" or a non-negative integer "HostStartTime".
   static os::Result<Contents> read(const std::string& path);
 };
 

@@ -21,6 +21,7 @@
 #include "platform/os/Format.h"
 #include "platform/os/Log.h"
 #include "platform/os/Paths.h"
+#include "platform/os/Process.h"
 #include "platform/value/Value.h"
 
 namespace launcher {
@@ -173,6 +174,11 @@ int removeLocked(const std::string& bundleIdentifier, const std::string& version
   return removed ? 0 : ServiceLauncher::kNoSuchService;
 }
 
+bool isSelf(std::uint64_t hostStartTime) {
+  os::Result<std::uint64_t> self = os::Process::startTime(getpid());
+  return self.ok() && self.value() == hostStartTime;
+}
+
 // The service recorded for this process, read with the table locked shared. A missing table,
 // directory or file all mean that this process was not made ready for the service.
 os::Result<ServiceFile::Contents> readOwnService(const std::string& bundleIdentifier,
@@ -184,7 +190,9 @@ os::Result<ServiceFile::Contents> readOwnService(const std::string& bundleIdenti
     os::Result<ServiceFile::Contents> read =
         ServiceFile::read(serviceFile(bundleIdentifier, version, self));
     const int errnum = read.ok() ? 0 : read.error().errnum;
-    if (errnum != ENOENT && errnum != ENOTDIR && errnum != ENAMETOOLONG) return read;
+    // A record of an earlier process that had this pid is not this process's.
+    if (read.ok() && isSelf(read.value().hostStartTime)) return read;
+    if (errnum != 0 && errnum != ENOENT && errnum != ENOTDIR && errnum != ENAMETOOLONG) return read;
   }
   return os::Error{EPERM, os::format("launcher: process %d was not made ready for %s %s",
                                      {self, bundleIdentifier, version})};
@@ -219,7 +227,9 @@ os::Status ServiceLauncher::addService(pid_t host, const std::string& bundleIden
   if (valid.ok()) valid = checkHost(host);
   if (valid.ok()) valid = checkExecutable(executablePath);
   if (!valid.ok()) return valid;
-  os::Result<std::string> xml = ServiceFile::encode({executablePath, description});
+  os::Result<std::uint64_t> started = os::Process::startTime(host);
+  if (!started.ok()) return os::Error{ESRCH, os::format("launcher: no process %d", {host})};
+  os::Result<std::string> xml = ServiceFile::encode({executablePath, description, started.value()});
   if (!xml.ok()) return xml.error();
   os::Status made = os::Paths::ensureDirectory(tableDir(), 0700);
   if (!made.ok()) return made;

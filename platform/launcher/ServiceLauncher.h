@@ -15,7 +15,8 @@ namespace launcher {
 
 // The service launcher's table: which host process may start which plug-in, from which
 // executable and under which description. A service is the triple (host pid, bundle identifier,
-// version); its executable and description live in
+// version); its executable, its description and when the host started (so that a record
+// outlives no process: a later process that gets the same pid is not the host) live in
 //   <runtime dir>/launcher/<escaped identifier>/<escaped version>/<host pid>.plist
 // (format in ServiceFile, escaping in ServiceName). The table is the files: every process on the
 // same device root sees the same services.
@@ -58,7 +59,8 @@ class ServiceLauncher {
   // entries of the description's "ZynService" "EnvironmentVariables" (none when absent; entries
   // that are not strings, or whose name is empty or holds '=', are skipped with a log line).
   // Nothing else of this process is passed on (see CleanSpawn). Returns the child's pid; the
-  // caller reaps it. Fails with EPERM when this process was not made ready for the plug-in,
+  // caller reaps it. Fails with EPERM when this process was not made ready for the plug-in (a
+  // record for an earlier process that had this pid does not count),
   // EINVAL for an empty identifier or version or a broken record, or the errno of reading the
   // record or of posix_spawn (ENOENT when the executable has gone since).
   static os::Result<pid_t> start(const std::string& bundleIdentifier, const std::string& version);

@@ -7,6 +7,10 @@
 #include <cerrno>
 #include <climits>
 #include <csignal>
+#include <cstdlib>
+#include <fstream>
+#include <sstream>
+#include <vector>
 
 // Both numbers are the same on every architecture that has the calls (Linux 5.1 and 5.3).
 #ifndef SYS_pidfd_send_signal
@@ -22,6 +26,17 @@ namespace {
 
 std::string exeLink(pid_t pid) {
   return "/proc/" + std::to_string(pid) + "/exe";
+}
+
+// The fields of a stat line after the command name, which is in parentheses and may hold
+// anything, ")" and blanks included; the first is field 3, the state.
+std::vector<std::string> fieldsAfterCommand(const std::string& line) {
+  std::vector<std::string> fields;
+  std::size_t end = line.rfind(')');
+  if (end == std::string::npos) return fields;
+  std::istringstream rest(line.substr(end + 1));
+  for (std::string field; rest >> field;) fields.push_back(field);
+  return fields;
 }
 
 Error noPidfd() {
@@ -57,6 +72,23 @@ Result<std::string> Process::executablePath(pid_t pid, int pidfd) {
   Status alive = checkAlive(pidfd);
   if (!alive.ok()) return alive.error();
   return std::string(buffer, static_cast<std::size_t>(n));
+}
+
+Result<std::uint64_t> Process::startTime(pid_t pid) {
+  const std::string path = "/proc/" + std::to_string(pid) + "/stat";
+  std::ifstream stat(path);
+  std::string line;
+  if (pid <= 0 || !stat || !std::getline(stat, line)) {
+    return Error{ESRCH, "no process " + std::to_string(pid)};
+  }
+  constexpr std::size_t kStartTime = 22 - 3;
+  std::vector<std::string> fields = fieldsAfterCommand(line);
+  char* end = nullptr;
+  errno = 0;
+  unsigned long long ticks =
+      fields.size() > kStartTime ? std::strtoull(fields[kStartTime].c_str(), &end, 10) : 0;
+  if (!end || *end != '\0' || errno != 0) return Error{EINVAL, path + ": no start time"};
+  return static_cast<std::uint64_t>(ticks);
 }
 
 Result<int> Process::openExecutable(pid_t pid, int pidfd) {

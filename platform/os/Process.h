@@ -2,6 +2,7 @@
 
 #include <sys/types.h>
 
+#include <cstdint>
 #include <string>
 
 #include "platform/os/Error.h"
@@ -27,6 +28,11 @@ class Process {
   // when |pidfd| is negative, ENOENT for a zombie or kernel thread, EACCES for a process we may
   // not inspect. A file replaced after the process started reads as "<path> (deleted)".
   static Result<std::string> executablePath(pid_t pid, int pidfd);
+
+  // When |pid| started, in clock ticks after boot (field 22 of /proc/<pid>/stat): with the pid,
+  // it names one process for as long as the machine runs, even after the pid is reused. Fails
+  // with ESRCH when no such process exists, EINVAL when the stat line cannot be read.
+  static Result<std::uint64_t> startTime(pid_t pid);
 
   // A read-only descriptor of the executable image |pid| is running (even when its file was
   // replaced or removed since), checked against |pidfd| like executablePath(). The caller owns
