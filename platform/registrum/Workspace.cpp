@@ -167,10 +167,18 @@ os::Result<std::shared_ptr<const PlugInRecord>> Workspace::registerPlugIn(const 
     os::Result<std::shared_ptr<const ApplicationRecord>> application =
         containingApplication(bundle.value());
     if (!application.ok()) return application.error();
+    os::Result<std::shared_ptr<const PlugInRecord>> earlier =
+        store_->plugInByPath(bundle.value().path);
+    if (!earlier.ok()) return earlier.error();
     os::Result<std::shared_ptr<const PlugInRecord>> stored =
         storePlugIn(bundle.value(), application.value(), options.dataContainer, files);
     if (!stored.ok()) return stored.error();
     registered = stored.value();
+    // Observers that keep what a record said (a cache) hear that the old one went first.
+    if (earlier.value()) {
+      os::Status replaced = store_->appendChange(Store::ChangeKind::Uninstall, {earlier.value()});
+      if (!replaced.ok()) return replaced;
+    }
     return store_->appendChange(Store::ChangeKind::Install, {registered});
   });
   if (!status.ok()) return status.error();

@@ -112,7 +112,8 @@ class Workspace {
   // nearest enclosing ".app" directory as a complete application when it is not yet known, and
   // stores the record with its plug-in dictionary resolved against its SDK. A path already
   // registered keeps its UUID and data container and has every other field refreshed. Returns
-  // the new record; observers get an install notice.
+  // the new record; observers get an install notice, preceded for a path already registered by
+  // an uninstall notice with the record as it was.
   os::Result<std::shared_ptr<const PlugInRecord>> registerPlugIn(const std::string& path,
                                                                  RegisterOptions options = {});
   // Removes the plug-in registered for |path| and its data container; ENOENT when none is.

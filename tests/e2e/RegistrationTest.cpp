@@ -95,6 +95,27 @@ TEST_F(RegistrationTest, AnUninstallByAnotherProcessReachesTheDaemon) {
   EXPECT_TRUE(daemon().waitForLog("UNINSTALLED:widget.one widget.one(1.0)"));
 }
 
+// A plug-in updated in place keeps its path and UUID; the daemon must serve what it says now.
+TEST_F(RegistrationTest, APlugInRegisteredAgainIsServedAsItIsNow) {
+  ASSERT_TRUE(start());
+  const std::string path = bundle("Notes", "updated");
+  ASSERT_EQ(send(AXProtocol::kAdd, {path}), "ok");
+  auto version = [&] {
+    value::Array forms =
+        match(Value::dictionary({{"QSExtensionIdentifier", Value::string("updated")}}));
+    const Value* found = forms.size() == 1 ? forms[0].asDictionary()->find("version") : nullptr;
+    return found && found->asString() ? *found->asString() : std::string("none");
+  };
+  ASSERT_EQ(version(), "1.0");
+  bundles::writePlugIn(path, {.id = "updated", .version = "2.0"});
+  auto registry = registrum::Workspace::open(root());
+  ASSERT_TRUE(registry.ok());
+  ASSERT_TRUE(registry.value()->registerPlugIn(path).ok());
+  ASSERT_TRUE(daemon().waitForLog("INSTALLED:updated updated(2.0)"));
+  EXPECT_EQ(logCount("UNINSTALLED:updated updated(1.0)"), 1u);
+  EXPECT_EQ(version(), "2.0");
+}
+
 TEST_F(RegistrationTest, AnnotateChecksEveryFieldBeforeStoringAnything) {
   ASSERT_TRUE(start({"-d", file_}));
   value::Uuid first = install("annotate.first");

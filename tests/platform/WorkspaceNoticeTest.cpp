@@ -1,3 +1,4 @@
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <spawn.h>
 #include <sys/wait.h>
@@ -60,17 +61,27 @@ class WorkspaceNoticeTest : public ::testing::Test {
                      Value::dictionary({{"grant", Value::boolean(true)}}));
   }
 
-  // Runs rgctl with |arguments| against the fixture's root; returns its exit status.
-  int rgctl(std::vector<std::string> arguments) {
+  // Starts rgctl with |arguments| against the fixture's root, its output into |out| when that is
+  // a descriptor; returns its pid, or -1.
+  pid_t spawnRgctl(std::vector<std::string> arguments, int out = -1) {
     std::vector<std::string> all = {RGCTL_PATH, "--root", root_.root()};
     all.insert(all.end(), arguments.begin(), arguments.end());
     std::vector<char*> argv;
     for (auto& argument : all) argv.push_back(argument.data());
     argv.push_back(nullptr);
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    if (out >= 0) posix_spawn_file_actions_adddup2(&actions, out, STDOUT_FILENO);
     pid_t pid = 0;
-    if (posix_spawn(&pid, RGCTL_PATH, nullptr, nullptr, argv.data(), environ) != 0) return -1;
+    int spawned = posix_spawn(&pid, RGCTL_PATH, &actions, nullptr, argv.data(), environ);
+    posix_spawn_file_actions_destroy(&actions);
+    return spawned == 0 ? pid : -1;
+  }
+
+  // The exit status of rgctl run to its end.
+  static int exitStatus(pid_t pid) {
     int status = 0;
-    waitpid(pid, &status, 0);
+    if (pid < 0 || waitpid(pid, &status, 0) != pid) return -1;
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
   }
 
@@ -78,38 +89,6 @@ class WorkspaceNoticeTest : public ::testing::Test {
   std::shared_ptr<Workspace> workspace_;
   std::shared_ptr<Workspace> other_;
 };
-
-TEST_F(WorkspaceNoticeTest, ObserverGetsEveryChangeOnceInOrder) {
-  auto early = std::make_shared<Collector>();
-  auto late = std::make_shared<Collector>();
-  ASSERT_TRUE(workspace_->addObserver(early).ok());
-  ASSERT_TRUE(workspace_->addObserver(early).ok());  // no second delivery
-  std::string path = root_ / "Notes.app/PlugIns/Share.appex";
-  auto first = other_->registerPlugIn(path).value();
-  ASSERT_TRUE(workspace_->addObserver(late).ok());
-  auto second = other_->registerPlugIn(path).value();
-  ASSERT_TRUE(other_->unregisterPlugIn(path).ok());
-
-  auto last = other_->registerPlugIn(path).value();
-  auto notices = early->await(4);
-  ASSERT_EQ(notices.size(), 4u);
-  EXPECT_NE(notices[3].plugIns[0]->uuid(), first->uuid());  // nothing repeated before it
-  EXPECT_EQ(notices[3].plugIns[0]->uuid(), last->uuid());
-  EXPECT_TRUE(notices[0].install);
-  EXPECT_TRUE(notices[1].install);
-  EXPECT_FALSE(notices[2].install);
-  EXPECT_EQ(notices[0].plugIns[0]->uuid(), first->uuid());
-  EXPECT_EQ(notices[1].plugIns[0]->registrationDate(), second->registrationDate());
-  const auto& removed = *notices[2].plugIns[0];
-  EXPECT_EQ(removed.uuid(), first->uuid());
-  EXPECT_EQ(removed.bundlePath(), path);
-  EXPECT_EQ(removed.bundleIdentifier(), "com.example.share");
-  EXPECT_EQ(removed.bundleVersion(), "1.0");
-  EXPECT_EQ(removed.entitlements(), first->entitlements());
-  EXPECT_EQ(removed.plugInDictionary(), first->plugInDictionary());
-  EXPECT_EQ(removed.containingApplication()->path(), root_ / "Notes.app");
-  EXPECT_EQ(late->await(3).size(), 3u);  // only the changes after it was added
-}
 
 TEST_F(WorkspaceNoticeTest, RemovedOrDestroyedObserversGetNothingMore) {
   auto kept = std::make_shared<Collector>();
@@ -128,41 +107,60 @@ TEST_F(WorkspaceNoticeTest, RemovedOrDestroyedObserversGetNothingMore) {
   EXPECT_TRUE(gone.expired());
 }
 
-TEST_F(WorkspaceNoticeTest, ChangesByRgctlReachAnObserverHere) {
-  auto observer = std::make_shared<Collector>();
-  ASSERT_TRUE(workspace_->addObserver(observer).ok());
-  ASSERT_EQ(rgctl({"install", "--placeholder", root_ / "Notes.app"}), 0);
-  ASSERT_EQ(rgctl({"finish", root_ / "Notes.app"}), 0);
-  ASSERT_EQ(rgctl({"uninstall", root_ / "Notes.app"}), 0);
-  ASSERT_EQ(rgctl({"uninstall", root_ / "Notes.app"}), 1);
-  auto notices = observer->await(3);
+// Each observer gets every change committed after it was added, once, in commit order; an
+// uninstall carries the records as they were.
+TEST_F(WorkspaceNoticeTest, ChangesByRgctlReachEveryObserverOnceInOrder) {
+  auto early = std::make_shared<Collector>();
+  auto late = std::make_shared<Collector>();
+  ASSERT_TRUE(workspace_->addObserver(early).ok());
+  ASSERT_TRUE(workspace_->addObserver(early).ok());  // no second delivery
+  ASSERT_EQ(exitStatus(spawnRgctl({"install", "--placeholder", root_ / "Notes.app"})), 0);
+  ASSERT_TRUE(workspace_->addObserver(late).ok());
+  ASSERT_EQ(exitStatus(spawnRgctl({"finish", root_ / "Notes.app"})), 0);
+  ASSERT_EQ(exitStatus(spawnRgctl({"uninstall", root_ / "Notes.app"})), 0);
+  auto notices = early->await(3);
   ASSERT_EQ(notices.size(), 3u);
   EXPECT_TRUE(notices[0].plugIns[0]->containingApplication()->isPlaceholder());
   EXPECT_FALSE(notices[1].plugIns[0]->containingApplication()->isPlaceholder());
   ASSERT_FALSE(notices[2].install);
   const auto& removed = *notices[2].plugIns[0];
   EXPECT_EQ(removed.uuid(), notices[0].plugIns[0]->uuid());
-  EXPECT_EQ(removed.plugInIdentifier(), "com.example.share");
+  EXPECT_EQ(removed.bundlePath(), root_ / "Notes.app/PlugIns/Share.appex");
   EXPECT_EQ(removed.entitlements().find("grant")->asBool(), true);
-  EXPECT_TRUE(removed.dataContainerPath());
+  EXPECT_EQ(removed.plugInDictionary(), notices[0].plugIns[0]->plugInDictionary());
+  auto later = late->await(2);
+  ASSERT_EQ(later.size(), 2u);
+  EXPECT_FALSE(later[0].plugIns[0]->containingApplication()->isPlaceholder());
+}
+
+// A cache of records must learn that a record it holds changed: registering a registered path
+// again announces the old record's end before the new record.
+TEST_F(WorkspaceNoticeTest, ARegistrationAgainEndsTheOldRecordFirst) {
+  auto observer = std::make_shared<Collector>();
+  ASSERT_TRUE(workspace_->addObserver(observer).ok());
+  const std::string path = root_ / "Notes.app/PlugIns/Share.appex";
+  ASSERT_TRUE(workspace_->registerPlugIn(path).ok());
+  root_.writePlist("Notes.app/PlugIns/Share.appex/Info.plist",
+                   Value::dictionary({{"QFBundleIdentifier", Value::string("com.example.share")},
+                                      {"QFBundleShortVersionString", Value::string("2.0")},
+                                      {"QSExtension", Value::dictionary({})}}));
+  ASSERT_TRUE(workspace_->registerPlugIn(path).ok());
+  auto notices = observer->await(3);
+  ASSERT_EQ(notices.size(), 3u);
+  EXPECT_TRUE(notices[0].install);
+  EXPECT_FALSE(notices[1].install);
+  EXPECT_TRUE(notices[2].install);
+  EXPECT_EQ(notices[1].plugIns[0]->bundleVersion(), "1.0");
+  EXPECT_EQ(notices[2].plugIns[0]->bundleVersion(), "2.0");
+  EXPECT_EQ(notices[2].plugIns[0]->uuid(), notices[0].plugIns[0]->uuid());
 }
 
 TEST_F(WorkspaceNoticeTest, ChangesHereReachRgctlWatchWithFullRecords) {
   int out[2];
-  ASSERT_EQ(pipe(out), 0);
-  posix_spawn_file_actions_t actions;
-  posix_spawn_file_actions_init(&actions);
-  posix_spawn_file_actions_adddup2(&actions, out[1], STDOUT_FILENO);
-  posix_spawn_file_actions_addclose(&actions, out[0]);
-  std::string root = root_.root();
-  std::vector<std::string> all = {RGCTL_PATH, "--root", root, "watch", "--json", "--count", "2"};
-  std::vector<char*> argv;
-  for (auto& argument : all) argv.push_back(argument.data());
-  argv.push_back(nullptr);
-  pid_t pid = 0;
-  ASSERT_EQ(posix_spawn(&pid, RGCTL_PATH, &actions, nullptr, argv.data(), environ), 0);
-  posix_spawn_file_actions_destroy(&actions);
+  ASSERT_EQ(pipe2(out, O_CLOEXEC), 0);
+  pid_t pid = spawnRgctl({"watch", "--json", "--count", "2"}, out[1]);
   close(out[1]);
+  ASSERT_GT(pid, 0);
   FILE* lines = fdopen(out[0], "r");
   char line[1 << 16];
   ASSERT_TRUE(fgets(line, sizeof line, lines));  // the observer is in place
@@ -174,9 +172,7 @@ TEST_F(WorkspaceNoticeTest, ChangesHereReachRgctlWatchWithFullRecords) {
   std::string install = fgets(line, sizeof line, lines) ? line : "";
   std::string uninstall = fgets(line, sizeof line, lines) ? line : "";
   fclose(lines);
-  int status = 0;
-  waitpid(pid, &status, 0);
-  EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+  EXPECT_EQ(exitStatus(pid), 0);
 
   EXPECT_NE(install.find("\"notice\":\"install\""), std::string::npos) << install;
   EXPECT_NE(uninstall.find("\"notice\":\"uninstall\""), std::string::npos) << uninstall;
