@@ -46,10 +46,10 @@ std::string elementName(const value::Value& element) {
 std::shared_ptr<const runtime::Protocol> compoundProtocol(const value::Array& names,
                                                           std::optional<AXError>* error) {
   std::string compoundName = "__XX_COMPOUND";
-  for (const value::Value& element : names) {
-    compoundName += os::format("__%@", {elementName(element)});
-  }
+  for (const value::Value& element : names) compoundName += "__" + elementName(element);
   runtime::Runtime& runtime = runtime::Runtime::shared();
+  // Made once and found by name afterwards, which is the common case: look before allocating.
+  if (auto existing = runtime.lookUpProtocol(compoundName)) return existing;
   std::shared_ptr<runtime::Protocol> compound = runtime.allocateProtocol(compoundName);
   if (!compound) {
     auto existing = runtime.lookUpProtocol(compoundName);

@@ -2,7 +2,6 @@
 
 #include <dirent.h>
 #include <fcntl.h>
-#include <signal.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -53,10 +52,11 @@ os::Status checkNames(const std::string& bundleIdentifier, const std::string& ve
   return os::Error{EINVAL, "launcher: empty bundle identifier or version"};
 }
 
-// A process we may not signal exists all the same; so does a zombie, whose parent has not yet
-// learnt of its end.
-os::Status checkHost(pid_t host) {
-  if (host > 0 && (kill(host, 0) == 0 || errno == EPERM)) return os::success();
+// When |host| started, which also tells that it exists: its stat file is there for any process,
+// another user's and a zombie whose parent has not yet learnt of its end included.
+os::Result<std::uint64_t> hostStartTime(pid_t host) {
+  os::Result<std::uint64_t> started = os::Process::startTime(host);
+  if (started.ok()) return started;
   return os::Error{ESRCH, os::format("launcher: no process %d", {host})};
 }
 
@@ -224,11 +224,11 @@ os::Status ServiceLauncher::addService(pid_t host, const std::string& bundleIden
                                        const std::string& executablePath,
                                        const value::Dictionary& description) {
   os::Status valid = checkNames(bundleIdentifier, version);
-  if (valid.ok()) valid = checkHost(host);
-  if (valid.ok()) valid = checkExecutable(executablePath);
   if (!valid.ok()) return valid;
-  os::Result<std::uint64_t> started = os::Process::startTime(host);
-  if (!started.ok()) return os::Error{ESRCH, os::format("launcher: no process %d", {host})};
+  os::Result<std::uint64_t> started = hostStartTime(host);
+  if (!started.ok()) return started.error();
+  valid = checkExecutable(executablePath);
+  if (!valid.ok()) return valid;
   os::Result<std::string> xml = ServiceFile::encode({executablePath, description, started.value()});
   if (!xml.ok()) return xml.error();
   os::Status made = os::Paths::ensureDirectory(tableDir(), 0700);

@@ -170,8 +170,8 @@ os::Result<std::shared_ptr<const PlugInRecord>> Workspace::registerPlugIn(const 
     os::Result<std::shared_ptr<const PlugInRecord>> earlier =
         store_->plugInByPath(bundle.value().path);
     if (!earlier.ok()) return earlier.error();
-    os::Result<std::shared_ptr<const PlugInRecord>> stored =
-        storePlugIn(bundle.value(), application.value(), options.dataContainer, files);
+    os::Result<std::shared_ptr<const PlugInRecord>> stored = storePlugIn(
+        bundle.value(), application.value(), earlier.value(), options.dataContainer, files);
     if (!stored.ok()) return stored.error();
     registered = stored.value();
     // Observers that keep what a record said (a cache) hear that the old one went first.
@@ -223,8 +223,10 @@ os::Result<std::shared_ptr<const ApplicationRecord>> Workspace::installApplicati
     if (!put.ok()) return put;
     PlugInList installed;
     for (const PlugInBundle& bundle : bundles.value()) {
+      os::Result<std::shared_ptr<const PlugInRecord>> earlier = store_->plugInByPath(bundle.path);
+      if (!earlier.ok()) return earlier.error();
       os::Result<std::shared_ptr<const PlugInRecord>> stored =
-          storePlugIn(bundle, application, options.dataContainer, files);
+          storePlugIn(bundle, application, earlier.value(), options.dataContainer, files);
       if (!stored.ok()) return stored.error();
       installed.push_back(stored.value());
     }
@@ -335,11 +337,9 @@ os::Result<std::shared_ptr<const ApplicationRecord>> Workspace::containingApplic
 
 os::Result<std::shared_ptr<const PlugInRecord>> Workspace::storePlugIn(
     const PlugInBundle& bundle, std::shared_ptr<const ApplicationRecord> application,
-    bool dataContainer, PendingFiles& files) {
-  os::Result<std::shared_ptr<const PlugInRecord>> earlier = store_->plugInByPath(bundle.path);
-  if (!earlier.ok()) return earlier.error();
+    const std::shared_ptr<const PlugInRecord>& earlier, bool dataContainer, PendingFiles& files) {
   PlugInRecord::Fields fields;
-  fields.uuid = earlier.value() ? earlier.value()->uuid() : value::Uuid::random();
+  fields.uuid = earlier ? earlier->uuid() : value::Uuid::random();
   fields.bundlePath = bundle.path;
   fields.containingApplication = std::move(application);
   fields.entitlements = bundle.entitlements;
@@ -354,8 +354,8 @@ os::Result<std::shared_ptr<const PlugInRecord>> Workspace::storePlugIn(
     os::Status made = os::Paths::ensureDirectory(container, 0700);
     if (!made.ok()) return made.error();
     fields.dataContainerPath = container;
-  } else if (earlier.value() && earlier.value()->dataContainerPath()) {
-    files.retired.push_back(*earlier.value()->dataContainerPath());
+  } else if (earlier && earlier->dataContainerPath()) {
+    files.retired.push_back(*earlier->dataContainerPath());
   }
   RecordFields::derive(fields);
   os::Status put = store_->putPlugIn(fields);

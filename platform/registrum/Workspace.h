@@ -155,10 +155,11 @@ class Workspace {
   // The application of |bundle| (registered now when unknown); null outside any application.
   os::Result<std::shared_ptr<const ApplicationRecord>> containingApplication(
       const PlugInBundle& bundle);
-  // Writes the plug-in row of |bundle|, keeping the UUID of the path's earlier row.
+  // Writes the plug-in row of |bundle|, keeping the UUID and data container of |earlier|, the
+  // row registered at its path before (null when none was).
   os::Result<std::shared_ptr<const PlugInRecord>> storePlugIn(
       const PlugInBundle& bundle, std::shared_ptr<const ApplicationRecord> application,
-      bool dataContainer, PendingFiles& files);
+      const std::shared_ptr<const PlugInRecord>& earlier, bool dataContainer, PendingFiles& files);
 
   const std::string root_;
   const std::unique_ptr<Store> store_;

@@ -62,7 +62,11 @@ os::Status MessageInterface::checkSelector(std::string_view selector) const {
 os::Status MessageInterface::check(std::string_view selector, int index, bool reply,
                                    const Argument& argument) const {
   os::Status declared = checkSelector(selector);
-  if (!declared.ok()) return declared;
+  return declared.ok() ? checkSlot(selector, index, reply, argument) : declared;
+}
+
+os::Status MessageInterface::checkSlot(std::string_view selector, int index, bool reply,
+                                       const Argument& argument) const {
   const Setting* setting = find(selector, index, reply);
   const auto& proxy = argument.proxyProtocol();
   if (!setting) {
@@ -89,7 +93,7 @@ os::Status MessageInterface::checkArguments(std::string_view selector, bool repl
   os::Status declared = checkSelector(selector);
   if (!declared.ok()) return declared;
   for (std::size_t i = 0; i < arguments.size(); ++i) {
-    os::Status status = check(selector, static_cast<int>(i), reply, arguments[i]);
+    os::Status status = checkSlot(selector, static_cast<int>(i), reply, arguments[i]);
     if (!status.ok()) return status;
   }
   return os::success();

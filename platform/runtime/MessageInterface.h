@@ -61,6 +61,9 @@ class MessageInterface {
   using Setting = std::variant<ClassSet, std::shared_ptr<const MessageInterface>>;
 
   os::Status checkSelector(std::string_view selector) const;
+  // check() without the selector's check.
+  os::Status checkSlot(std::string_view selector, int index, bool reply,
+                       const Argument& argument) const;
   const Setting* find(std::string_view selector, int index, bool reply) const;
 
   std::shared_ptr<const Protocol> protocol_;
