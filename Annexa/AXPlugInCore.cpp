@@ -277,7 +277,9 @@ std::optional<value::Dictionary> AXPlugInCore::attributes() const {
 }
 
 std::optional<std::string> AXPlugInCore::version() const {
-  return asString(attribute("QSExtensionVersion"));
+  std::optional<value::Value> declared = attribute("QSExtensionVersion");
+  if (!declared) return std::nullopt;
+  return sdk::versionText(*declared);
 }
 
 std::optional<value::Value> AXPlugInCore::protocolSpec() const {

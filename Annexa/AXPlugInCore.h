@@ -141,7 +141,8 @@ class AXPlugInCore {
   std::optional<std::string> containingPath() const;
   // pluginKey "QSExtensionAttributes" when it is a dictionary; absent otherwise.
   std::optional<value::Dictionary> attributes() const;
-  // attribute "QSExtensionVersion" when it is a string; absent otherwise (also for a number).
+  // attribute "QSExtensionVersion" as text (a number as its decimal text, sdk::versionText);
+  // absent when it is missing or of another type.
   std::optional<std::string> version() const;
   // pluginKey "QSExtensionProtocol" (string or array); "QSObject" for an app extension that has
   // none; else absent.

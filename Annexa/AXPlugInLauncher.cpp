@@ -4,19 +4,14 @@
 #include <optional>
 #include <string>
 
-#include "Annexa/AXProtocol.h"
 #include "platform/launcher/ServiceLauncher.h"
 #include "platform/value/Value.h"
 
 namespace {
 
-constexpr const char* kBundleInfo = "bundleInfo";
-constexpr const char* kBundleIdentifier = "QFBundleIdentifier";
-constexpr const char* kBundleVersion = "QFBundleShortVersionString";
-
 // The string under |key|, when it is one and not empty: the launcher's table has no empty names.
-std::optional<std::string> nameIn(const value::Dictionary& info, const char* key) {
-  const value::Value* found = info.find(key);
+std::optional<std::string> nameIn(const value::Dictionary& form, const char* key) {
+  const value::Value* found = form.find(key);
   const std::string* text = found ? found->asString() : nullptr;
   if (!text || text->empty()) return std::nullopt;
   return *text;
@@ -32,11 +27,9 @@ os::Error refusal(const value::Dictionary& form, const std::string& missing) {
 }  // namespace
 
 os::Result<pid_t> AXPlugInLauncher::launch(const value::Dictionary& form) {
-  const value::Dictionary* info = AXProtocol::getDictionary(form, kBundleInfo);
-  if (!info) return refusal(form, "\"bundleInfo\" dictionary");
-  std::optional<std::string> identifier = nameIn(*info, kBundleIdentifier);
-  if (!identifier) return refusal(form, "\"QFBundleIdentifier\" in its \"bundleInfo\"");
-  std::optional<std::string> version = nameIn(*info, kBundleVersion);
-  if (!version) return refusal(form, "\"QFBundleShortVersionString\" in its \"bundleInfo\"");
+  std::optional<std::string> identifier = nameIn(form, "identifier");
+  if (!identifier) return refusal(form, "\"identifier\"");
+  std::optional<std::string> version = nameIn(form, "version");
+  if (!version) return refusal(form, "\"version\"");
   return launcher::ServiceLauncher::start(*identifier, *version);
 }

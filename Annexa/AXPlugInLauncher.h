@@ -11,10 +11,10 @@
 class AXPlugInLauncher {
  public:
   // Starts the plug-in whose discovered form is |form| and returns the child's pid; the caller
-  // owns the child and reaps it. The service is named by the "QFBundleIdentifier" and
-  // "QFBundleShortVersionString" strings of the form's "bundleInfo". Fails with EINVAL, and a
-  // message naming the missing piece and the plug-in's "uuid", when "bundleInfo" is no
-  // dictionary or either string is missing or empty; with EPERM when this process was not made
+  // owns the child and reaps it. The service is named by the form's "identifier" and "version",
+  // which every discovered form carries. Fails with EINVAL, and a message naming the missing
+  // piece and the plug-in's "uuid", when either is missing, empty or not a string; with EPERM
+  // when this process was not made
   // ready for the plug-in; else with the launcher's error (launcher::ServiceLauncher::start),
   // e.g. ENOENT when the executable has gone since.
   static os::Result<pid_t> launch(const value::Dictionary& form);

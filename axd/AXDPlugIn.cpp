@@ -104,6 +104,11 @@ std::optional<value::Value> AXDPlugIn::attribute(std::string_view key) const {
   return lookup(key, Scope::Attributes);
 }
 
+std::optional<value::Value> AXDPlugIn::manifestValue(std::string_view key) const {
+  if (!rgproxy_) return std::nullopt;
+  return rgproxy_->manifestValue(key);
+}
+
 std::optional<value::Dictionary> AXDPlugIn::bundleInfoDictionary() const {
   if (!rgproxy_) return std::nullopt;
   return rgproxy_->infoDictionary();

@@ -46,6 +46,9 @@ class AXDPlugIn : public AXPlugInCore {
   std::optional<value::Value> attribute(std::string_view key) const override;
   // The registry record's Info.plist.
   std::optional<value::Dictionary> bundleInfoDictionary() const override;
+  // The plug-in's manifest value for |key|: the attribute, else the plug-in dictionary's entry,
+  // else Info.plist's (registrum::PlugInRecord::manifestValue); absent when none has it.
+  std::optional<value::Value> manifestValue(std::string_view key) const;
 
   // The cached display name; when the cache is empty, the registry's value (for the containing
   // name, that of the containing application), stored in the cache and returned. Absent, and
@@ -95,7 +98,7 @@ class AXDPlugIn : public AXPlugInCore {
   // One entry: the plug-in value named by |key| against |pattern|. Keys: "ENTITLEMENT:<name>",
   // "QSExtensionIdentifier", "<vendor prefix>.uuid", "QSUserElection" (the election with bits 8
   // to 15 cleared, in decimal; 0 without one), "QSExtensionContainingApp" (never matches
-  // without a containing application), else the attribute of that name, else the manifest key.
+  // without a containing application), else the manifestValue of that name.
   // Patterns: true (present and not the boolean false), false (absent or the boolean false), a
   // dictionary (matchDictionary), a string or an array of strings (matchValuePatterns against a
   // string value, or against any string element of an array value). Anything else: false.
@@ -128,15 +131,17 @@ class AXDPlugIn : public AXPlugInCore {
   // ---- Enabling for a host (AXDPlugInEnabling.cpp) -------------------------------------------
 
   // Registers the plug-in with the service launcher as an external service of host process
-  // |pid|, under a description built afresh: the environment (the data container's "HOME",
+  // |pid|, named by its identifier and version (which every record has), under a description
+  // built afresh: the environment (the data container's "HOME",
   // "QFFIXED_USER_HOME" and "TMPDIR", the daemon's "AXTEST_SDK", then the manifest's
   // "ZynService" "EnvironmentVariables"), the sandbox profile, and the manifest's "ZynService".
-  // An error of code 4 when the bundle has no executable (nothing registered) or the launcher
-  // refuses (logged with its error number).
+  // The data container and its "tmp" are made (mode 0700) when missing, so HOME and TMPDIR are
+  // usable from the plug-in's first instruction. An error of code 4 when the bundle has no
+  // executable or its container cannot be made (nothing registered), or the launcher refuses
+  // (logged with its error number).
   std::optional<AXError> enableForPid(pid_t pid) const;
-  // The busy answer, {"ExtensionBundleIdentifier": <bundle identifier>}, when a process of the
-  // plug-in's bundle runs; nothing when none does. Without a bundle identifier each running
-  // instance is logged as incomplete and none counts.
+  // The busy answer, {"ExtensionBundleIdentifier": <bundle identifier, else the plug-in
+  // identifier>}, when a process of the plug-in's bundle runs; nothing when none does.
   std::optional<value::Dictionary> checkBusy() const;
   // The sandbox profile the plug-in runs under: "plugin", "keyboard", "network-filter" or
   // "glanced", by its extension point.

@@ -10,6 +10,7 @@
 #include "platform/launcher/ServiceLauncher.h"
 #include "platform/os/Format.h"
 #include "platform/os/Log.h"
+#include "platform/os/Paths.h"
 
 namespace {
 
@@ -39,6 +40,16 @@ value::Dictionary overlay(value::Dictionary base, const value::Dictionary& overr
   return base;
 }
 
+// Makes the data container and its "tmp" private directories, so that the HOME and TMPDIR the
+// plug-in is given exist before it starts. The error when either cannot be made.
+std::optional<os::Error> prepareContainer(const std::string& container) {
+  for (const std::string& directory : {container, container + "/tmp"}) {
+    os::Status made = os::Paths::ensurePrivateDirectory(directory);
+    if (!made.ok()) return made.error();
+  }
+  return std::nullopt;
+}
+
 }  // namespace
 
 std::string AXDPlugIn::sandboxProfile() const {
@@ -61,6 +72,12 @@ std::optional<AXError> AXDPlugIn::enableForPid(pid_t pid) const {
   std::string uuidText = uuid() ? uuid()->string() : "(null)";
   value::Dictionary environment;
   if (const auto& container = rgproxy_->dataContainerPath()) {
+    if (std::optional<os::Error> unusable = prepareContainer(*container)) {
+      os::Log::notice("cannot prepare the data container of plug-in %@(%@) %@: %@",
+                      {id, version, uuidText, unusable->message});
+      return AXMakeErrorWithFormat(kEnableFailed, "unable to enable plug-in %@(%@) for pid %d",
+                                   {id, uuidText, pid});
+    }
     environment = environment.with("HOME", value::Value::string(*container))
                       .with("QFFIXED_USER_HOME", value::Value::string(*container))
                       .with("TMPDIR", value::Value::string(*container + "/tmp"));
@@ -96,8 +113,7 @@ std::optional<AXError> AXDPlugIn::enableForPid(pid_t pid) const {
                                  {id, uuidText});
   }
   os::Status added = launcher::ServiceLauncher::addService(
-      pid, rgproxy_->bundleIdentifier().value_or(""), rgproxy_->bundleVersion().value_or(""),
-      *executable, description);
+      pid, identifier().value_or(""), this->version().value_or(""), *executable, description);
   if (added.ok()) return std::nullopt;
   os::Log::notice("zyn error %d allowing pid %d to use plug-in %@(%@) %@ at %@",
                   {added.error().errnum, pid, id, version, uuidText, path()});
@@ -106,16 +122,11 @@ std::optional<AXError> AXDPlugIn::enableForPid(pid_t pid) const {
 }
 
 std::optional<value::Dictionary> AXDPlugIn::checkBusy() const {
-  std::vector<launcher::BusyInstances::Instance> running = launcher::BusyInstances::find(path());
-  if (running.empty()) return std::nullopt;
+  if (launcher::BusyInstances::find(path()).empty()) return std::nullopt;
+  // A plug-in named only by its plug-in identifier is as busy as any other: a hold must not be
+  // granted over it.
   std::optional<value::Value> bundleIdentifier = infoKey("QFBundleIdentifier");
-  if (const std::string* text = bundleIdentifier ? bundleIdentifier->asString() : nullptr) {
-    return value::Dictionary{{AXDNames::kBusyBundleIdentifierKey, value::Value::string(*text)}};
-  }
-  // Every instance is one of this bundle, so none can name a bundle identifier.
-  for (std::size_t i = 0; i < running.size(); ++i) {
-    os::Log::notice("vigild reported incomplete bundle for plug-in %@",
-                    {identifier().value_or("(null)")});
-  }
-  return std::nullopt;
+  const std::string* text = bundleIdentifier ? bundleIdentifier->asString() : nullptr;
+  std::string name = text ? *text : identifier().value_or("");
+  return value::Dictionary{{AXDNames::kBusyBundleIdentifierKey, value::Value::string(name)}};
 }

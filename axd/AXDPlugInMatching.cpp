@@ -75,8 +75,7 @@ bool AXDPlugIn::matchKey(const std::string& key, const value::Value& pattern) co
     if (!containing) return false;
     found = value::Value::string(*containing);
   } else {
-    found = attribute(key);
-    if (!found) found = infoKey(key);
+    found = manifestValue(key);
   }
 
   if (auto flag = pattern.asBool())

@@ -122,9 +122,9 @@ std::shared_ptr<AXDPlugInHold> AXDServer::takeHold(
 void AXDServer::removedPlugIns(const registrum::PlugInList& plugIns) {
   std::weak_ptr<AXDServer> weak = std::static_pointer_cast<AXDServer>(shared_from_this());
   for (const auto& record : plugIns) {
-    // The launcher keeps no service without both names, so there is nothing to withdraw.
-    const auto& id = record->bundleIdentifier();
-    const auto& version = record->bundleVersion();
+    // Services are named as enabling names them; without both names there is none to withdraw.
+    const auto& id = record->plugInIdentifier();
+    const auto& version = record->plugInVersion();
     if (!id || id->empty() || !version || version->empty()) continue;
     auto completion = [weak, identifier = *id](int result) {
       if (result == 0 || result == launcher::ServiceLauncher::kNoSuchService) return;

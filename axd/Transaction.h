@@ -101,8 +101,9 @@ class Transaction {
   // ("the plug-in is on hold"), then, except for a data plug-in, the access policy.
   std::optional<std::string> readyRefusal(const AXDPlugIn& plugIn);
   // Hold mode of the lock request: the plug-ins |flags| name at each path, or nothing when a
-  // path fails (the failure sent).
-  std::optional<std::vector<std::shared_ptr<AXDPlugIn>>> plugInsToHold(std::uint64_t flags);
+  // path fails (the failure sent). |paths| receives the canonical path of each bundle held.
+  std::optional<std::vector<std::shared_ptr<AXDPlugIn>>> plugInsToHold(
+      std::uint64_t flags, std::vector<std::string>& paths);
 
   // An integer field of the request; 0 when absent or not an unsigned integer.
   std::uint64_t integerField(const char* key) const;

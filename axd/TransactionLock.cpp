@@ -29,7 +29,8 @@ void Transaction::lockDownPlugIns() {
     return;
   }
   std::uint64_t flags = integerField(AXProtocol::kFlags);
-  std::optional<std::vector<std::shared_ptr<AXDPlugIn>>> held = plugInsToHold(flags);
+  std::vector<std::string> paths;
+  std::optional<std::vector<std::shared_ptr<AXDPlugIn>>> held = plugInsToHold(flags, paths);
   if (!held) return;
   std::vector<std::shared_ptr<AXDPlugIn>> busy;
   value::Array conflicts;
@@ -48,7 +49,7 @@ void Transaction::lockDownPlugIns() {
     fail(AXProtocol::kBusy, "plug-ins are busy");
     return;
   }
-  auto hold = std::make_shared<AXDPlugInHold>(*held, client_);
+  auto hold = std::make_shared<AXDPlugInHold>(*held, std::move(paths), client_);
   server()->addHold(hold);
   reply_.set(AXProtocol::kUuids, value::Value::uuid(hold->uuid()));
   server()->debug("hold request granted uuid:%@", {hold->uuid().string()});
@@ -56,7 +57,7 @@ void Transaction::lockDownPlugIns() {
 }
 
 std::optional<std::vector<std::shared_ptr<AXDPlugIn>>> Transaction::plugInsToHold(
-    std::uint64_t flags) {
+    std::uint64_t flags, std::vector<std::string>& paths) {
   std::vector<std::shared_ptr<AXDPlugIn>> held;
   bool walked = marshalPaths([&](const std::string& path, bool resolved) {
     if (!resolved) {
@@ -66,12 +67,15 @@ std::optional<std::vector<std::shared_ptr<AXDPlugIn>>> Transaction::plugInsToHol
     if (flags == AXProtocol::kHoldPlugIns) {
       std::shared_ptr<AXDPlugIn> plugIn = server()->findPlugInAtPath(path);
       if (!plugIn) fail(AXProtocol::kBadPath, os::format("no plug-in at path:%@", {path}));
-      if (plugIn) held.push_back(plugIn);
-      return plugIn != nullptr;
+      if (!plugIn) return false;
+      held.push_back(plugIn);
+      paths.push_back(plugIn->path());
+      return true;
     }
     if (flags == AXProtocol::kHoldApplications) {
       auto within = server()->plugInsWithinApplication(path);
       if (within) held.insert(held.end(), within->begin(), within->end());
+      paths.push_back(path);
       return true;
     }
     fail(AXProtocol::kMalformedRequest, "invalid request format (unsupported hold flags)");

@@ -27,13 +27,9 @@ os::Status writePlist(const std::string& directory, const Dictionary& contents) 
 }
 
 os::Status writePlugIn(const std::string& application, const std::string& id) {
-  const Value point = Value::string(PlugInPopulation::kExtensionPoint);
-  // The point among the attributes too, where match rules look and where an SDK would put it.
   Dictionary extension{
-      {"QSExtensionPointIdentifier", point},
+      {"QSExtensionPointIdentifier", Value::string(PlugInPopulation::kExtensionPoint)},
       {"QSExtensionProtocol", Value::string("BenchProtocol")},
-      {"QSExtensionAttributes",
-       Value::dictionary(Dictionary{{"QSExtensionPointIdentifier", point}})},
   };
   return writePlist(application + "/PlugIns/" + id + ".appex",
                     Dictionary{

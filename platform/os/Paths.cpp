@@ -1,5 +1,6 @@
 #include "platform/os/Paths.h"
 
+#include <fcntl.h>
 #include <pwd.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -114,6 +115,16 @@ Status Paths::ensureDirectory(const std::string& path, mode_t mode) {
     return success();
   }
   return failed;
+}
+
+Status Paths::ensurePrivateDirectory(const std::string& path) {
+  Status made = ensureDirectory(path, 0700);
+  if (!made.ok() && made.error().errnum != ENOTDIR) return made;
+  int fd = open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
+  if (fd < 0) return Error::fromErrno("open " + path);
+  Status status = fchmod(fd, 0700) == 0 ? success() : Error::fromErrno("chmod " + path);
+  close(fd);
+  return status;
 }
 
 }  // namespace os

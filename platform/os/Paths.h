@@ -45,6 +45,10 @@ class Paths {
   // the umask). An existing directory keeps its mode. Fails with ENOTDIR when |path| or a
   // parent is something else, or with the error of the mkdir that failed.
   static Status ensureDirectory(const std::string& path, mode_t mode);
+  // Makes sure |path| is a directory that only its owner may use: creates it and any missing
+  // parents (as ensureDirectory, mode 0700) and sets its mode to 0700. A symbolic link at
+  // |path| is refused (ELOOP), never followed: the directory may be another process's to change.
+  static Status ensurePrivateDirectory(const std::string& path);
 };
 
 }  // namespace os

@@ -15,4 +15,11 @@ std::optional<value::Value> PlugInRecord::valueForKey(std::string_view key, Scop
   return *found;
 }
 
+std::optional<value::Value> PlugInRecord::manifestValue(std::string_view key) const {
+  for (Scope scope : {Scope::Attributes, Scope::PlugInDictionary, Scope::InfoDictionary}) {
+    if (std::optional<value::Value> found = valueForKey(key, scope)) return found;
+  }
+  return std::nullopt;
+}
+
 }  // namespace registrum

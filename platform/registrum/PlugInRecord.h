@@ -31,6 +31,7 @@ class PlugInRecord {
     std::optional<std::string> originalIdentifier;
     std::optional<std::string> bundleIdentifier;
     std::optional<std::string> bundleVersion;
+    std::optional<std::string> plugInVersion;
     std::optional<std::string> extensionPointIdentifier;
     value::Dictionary entitlements;
     double registrationDate = 0;
@@ -66,6 +67,9 @@ class PlugInRecord {
   const std::optional<std::string>& bundleIdentifier() const { return fields_.bundleIdentifier; }
   // Info.plist's "QFBundleShortVersionString" when it is a string; nothing otherwise.
   const std::optional<std::string>& bundleVersion() const { return fields_.bundleVersion; }
+  // The plug-in's version: its attribute "QSExtensionVersion" as text (sdk::versionText), which
+  // every registered plug-in has; nothing only in records built by hand.
+  const std::optional<std::string>& plugInVersion() const { return fields_.plugInVersion; }
   // The plug-in dictionary's "QSExtensionPointIdentifier" when it is a string; nothing
   // otherwise.
   const std::optional<std::string>& extensionPointIdentifier() const {
@@ -97,6 +101,10 @@ class PlugInRecord {
   // The value under |key| in |scope|, of any type; nothing when the key is absent (or, for
   // Attributes, when the plug-in dictionary has no attributes dictionary).
   std::optional<value::Value> valueForKey(std::string_view key, Scope scope) const;
+  // The plug-in's manifest value for |key|, the one lookup that rules, exclusions, restriction
+  // entitlements and the registry's pre-selection share: the attribute, else the plug-in
+  // dictionary's entry, else Info.plist's; nothing when none has the key.
+  std::optional<value::Value> manifestValue(std::string_view key) const;
 
   const Fields& fields() const { return fields_; }
 

@@ -1,5 +1,7 @@
 #include "platform/registrum/RecordFields.h"
 
+#include "platform/sdk/SdkMerge.h"
+
 namespace registrum {
 
 namespace {
@@ -29,6 +31,9 @@ void RecordFields::derive(PlugInRecord::Fields& fields) {
   fields.originalIdentifier = fields.plugInIdentifier;
   fields.bundleIdentifier = string(info, "QFBundleIdentifier");
   fields.bundleVersion = string(info, "QFBundleShortVersionString");
+  std::optional<value::Value> version =
+      PlugInRecord(fields).valueForKey("QSExtensionVersion", PlugInRecord::Scope::Attributes);
+  fields.plugInVersion = version ? sdk::versionText(*version) : std::nullopt;
   fields.extensionPointIdentifier = string(fields.plugInDictionary, kPointKey);
   fields.localizedName = firstString(info, "QFBundleDisplayName", "QFBundleName");
   fields.localizedShortName = firstString(info, "QFBundleName", "QFBundleDisplayName");
@@ -46,16 +51,9 @@ ApplicationRecord::Fields RecordFields::application(std::string path, const valu
 }
 
 std::optional<std::string> RecordFields::rulePoint(const PlugInRecord::Fields& fields) {
-  PlugInRecord record(fields);
-  for (auto scope : {PlugInRecord::Scope::Attributes, PlugInRecord::Scope::InfoDictionary,
-                     PlugInRecord::Scope::PlugInDictionary}) {
-    std::optional<value::Value> found = record.valueForKey(kPointKey, scope);
-    if (!found) continue;
-    const std::string* text = found->asString();
-    if (!text) return std::nullopt;
-    return *text;
-  }
-  return std::nullopt;
+  std::optional<value::Value> found = PlugInRecord(fields).manifestValue(kPointKey);
+  if (!found || !found->asString()) return std::nullopt;
+  return *found->asString();
 }
 
 }  // namespace registrum

@@ -17,7 +17,7 @@ class RecordFields {
   static std::optional<std::string> string(const value::Dictionary& dictionary,
                                            std::string_view key);
 
-  // Fills the identifiers, bundle version, extension point and names of |fields| from its
+  // Fills the identifiers, versions, extension point and names of |fields| from its
   // infoDictionary and plugInDictionary (see PlugInRecord for each rule).
   static void derive(PlugInRecord::Fields& fields);
 
@@ -26,9 +26,8 @@ class RecordFields {
                                                bool placeholder);
 
   // The extension point that a match-rule entry "QSExtensionPointIdentifier" sees: the
-  // attribute of that name, else the Info.plist key, else the plug-in dictionary's, when the
-  // first one present is a string. Nothing when that value is not a string or none is present,
-  // which pre-selection treats as "may match".
+  // plug-in's manifestValue of that name when it is a string. Nothing when that value is not a
+  // string or none is present, which pre-selection treats as "may match".
   static std::optional<std::string> rulePoint(const PlugInRecord::Fields& fields);
 };
 

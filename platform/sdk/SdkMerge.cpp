@@ -1,6 +1,9 @@
 #include "platform/sdk/SdkMerge.h"
 
 #include <algorithm>
+#include <array>
+#include <charconv>
+#include <cstdint>
 #include <map>
 
 namespace sdk {
@@ -58,6 +61,23 @@ Value mergeSharedResources(const Value& sdkSide, const Value& manifestSide) {
   return Value::array(std::move(merged));
 }
 
+std::optional<std::string> versionText(const Value& version) {
+  if (const std::string* text = version.asString()) return *text;
+  if (std::optional<std::int64_t> signedNumber = version.asInt()) {
+    return std::to_string(*signedNumber);
+  }
+  if (std::optional<std::uint64_t> unsignedNumber = version.asUInt()) {
+    return std::to_string(*unsignedNumber);
+  }
+  std::optional<double> real = version.asReal();
+  if (!real) return std::nullopt;
+  // The shortest text that reads back as the same number: 1.5 stays "1.5", 2.0 becomes "2".
+  std::array<char, 32> buffer;
+  auto [end, error] = std::to_chars(buffer.data(), buffer.data() + buffer.size(), *real);
+  if (error != std::errc()) return std::nullopt;
+  return std::string(buffer.data(), end);
+}
+
 value::Dictionary canonicalize(const value::Dictionary& info) {
   const Value* plugIn = info.find("QSExtension");
   const value::Dictionary* plugInDictionary = plugIn ? plugIn->asDictionary() : nullptr;
@@ -65,7 +85,10 @@ value::Dictionary canonicalize(const value::Dictionary& info) {
   const Value* attributesValue = plugInDictionary->find("QSExtensionAttributes");
   const value::Dictionary* existing = attributesValue ? attributesValue->asDictionary() : nullptr;
   value::Dictionary attributes = existing ? *existing : value::Dictionary();
-  if (!attributes.find("QSExtensionVersion")) {
+  const Value* version = attributes.find("QSExtensionVersion");
+  if (version && version->isNumber()) {
+    attributes = attributes.with("QSExtensionVersion", Value::string(*versionText(*version)));
+  } else if (!version) {
     const Value* bundleVersion = info.find("QFBundleShortVersionString");
     bool usable = bundleVersion && bundleVersion->asString();
     attributes =

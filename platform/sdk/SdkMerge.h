@@ -1,5 +1,7 @@
 #pragma once
 
+#include <optional>
+#include <string>
 #include <string_view>
 
 #include "platform/value/Value.h"
@@ -29,10 +31,15 @@ bool sdkOverridesKey(std::string_view key);
 // null) counts as the empty list. Elements that are not strings are kept as they are.
 value::Value mergeSharedResources(const value::Value& sdkSide, const value::Value& manifestSide);
 
+// A plug-in version as text: a string is itself; a number is its decimal text ("2", "1.5"), since
+// manifests written by hand often say <integer>2</integer>. Nothing for any other value.
+std::optional<std::string> versionText(const value::Value& version);
+
 // |info| with its plug-in dictionary ("QSExtension") given an attributes dictionary
 // ("QSExtensionAttributes"; a missing or non-dictionary one becomes empty) that holds a
-// "QSExtensionVersion": the attributes' own, else |info|'s "QFBundleShortVersionString" when it
-// is a string, else "1". |info| is returned unchanged when its "QSExtension" is no dictionary.
+// "QSExtensionVersion" string: the attributes' own (a number becomes its versionText), else
+// |info|'s "QFBundleShortVersionString" when it is a string, else "1". A version of any other
+// type is left as it is. |info| is returned unchanged when its "QSExtension" is no dictionary.
 value::Dictionary canonicalize(const value::Dictionary& info);
 
 }  // namespace sdk

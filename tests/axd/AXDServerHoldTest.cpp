@@ -29,7 +29,7 @@ class AXDServerHoldTest : public ::testing::Test {
   }
   std::shared_ptr<AXDPlugInHold> hold(std::vector<std::shared_ptr<AXDPlugIn>> plugIns,
                                       const std::shared_ptr<AXDZynClient>& client = nullptr) {
-    auto made = std::make_shared<AXDPlugInHold>(plugIns, client);
+    auto made = std::make_shared<AXDPlugInHold>(plugIns, std::vector<std::string>{}, client);
     server_->addHold(made);
     return made;
   }
