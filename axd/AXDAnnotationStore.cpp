@@ -44,12 +44,23 @@ std::optional<AXError> rejection(const std::string& path, const value::Dictionar
   const value::Value* data = top.find("data");
   if (!data) return unparsable(path, "it has no \"data\"");
   if (!data->asDictionary()) return unparsable(path, "its \"data\" is not a dictionary");
-  for (const auto& [key, annotation] : *data->asDictionary()) {
-    if (!annotation.asDictionary()) {
-      return unparsable(path, "the annotation of \"" + key + "\" is not a dictionary");
-    }
-  }
   return std::nullopt;
+}
+
+// The annotations of |data|, the "data" table of the file |path|. An entry that is not a
+// dictionary was not written by axd: it is skipped with a log line, so one foreign entry cannot
+// cost the user every election.
+value::Dictionary annotationsIn(const std::string& path, const value::Dictionary& data) {
+  std::map<std::string, value::Value> kept;
+  for (const auto& [key, annotation] : data) {
+    if (annotation.asDictionary()) {
+      kept.emplace(key, annotation);
+      continue;
+    }
+    os::Log::write(5,
+                   os::format("skipping annotation \"%@\" of %@: not a dictionary", {key, path}));
+  }
+  return value::Dictionary(std::move(kept));
 }
 
 // The annotation table in the file |path| into |table|, or the error that rejects the file.
@@ -59,7 +70,7 @@ std::optional<AXError> readTable(const std::string& path, value::Dictionary* tab
   const value::Dictionary* top = read.value().asDictionary();
   if (!top) return unparsable(path, "its top level is not a dictionary");
   std::optional<AXError> rejected = rejection(path, *top);
-  if (!rejected) *table = *top->find("data")->asDictionary();
+  if (!rejected) *table = annotationsIn(path, *top->find("data")->asDictionary());
   return rejected;
 }
 

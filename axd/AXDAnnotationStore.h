@@ -46,7 +46,7 @@ class AXDAnnotationStore {
   static std::string defaultDatabaseURL();
 
   // The annotation stored under |key|, or nothing when there is none (or when the entry is not
-  // a dictionary, which only setAnnotations can put there).
+  // a dictionary, which only setAnnotations can put there: loading skips such entries).
   std::optional<value::Dictionary> annotationForIdentifier(const std::string& key) const;
   // annotationForIdentifier of |plugIn|'s annotation key.
   std::optional<value::Dictionary> annotationForPlugIn(const AXDPlugIn& plugIn) const;
@@ -58,12 +58,13 @@ class AXDAnnotationStore {
   // save.
   void setAnnotation(const std::optional<value::Dictionary>& annotation, const AXDPlugIn& plugIn);
 
-  // Replaces the table with the one in annotationsURL(). On failure returns false, leaves the
-  // table as it was, fires the db-load probe with the error's domain and code and, when |error|
-  // is not null, stores the error there: ENOENT for a missing file, EINVAL for a file that is not
-  // a property list, whose top level or "data" is not a dictionary, that has no "data", or
-  // whose "data" holds an entry that is not a dictionary; the Annexa error 7 when the integer
-  // value of "version" (0 when missing or not a number) is not 16.
+  // Replaces the table with the one in annotationsURL(), less its entries that are not
+  // dictionaries, each logged as "skipping annotation "<key>" of <path>: not a dictionary". On
+  // failure returns false, leaves the table as it was, fires the db-load probe with the error's
+  // domain and code and, when |error| is not null, stores the error there: ENOENT for a missing
+  // file, EINVAL for a file that is not a property list, whose top level or "data" is not a
+  // dictionary, or that has no "data"; the Annexa error 7 when the integer value of "version" (0
+  // when missing or not a number) is not 16.
   bool loadDb(std::optional<AXError>* error);
 
   // Writes the table to annotationsURL() as an XML property list, atomically: the new content

@@ -9,9 +9,9 @@ namespace types {
 // offers? Stateless apart from the type database (see TypeRegistry); safe to call from any
 // thread.
 //
-// A rule is a dictionary from type identifiers (wildcards "major/*" allowed) to the most items
-// conforming to that type the plug-in accepts: a positive integer, or the boolean true for any
-// number. The optional key "MaxItems" (a positive integer) caps the number of items in total.
+// A rule is a dictionary from type identifiers (wildcards "major/*" and "*/*" allowed) to the most
+// items conforming to that type the plug-in accepts: a positive integer, or the boolean true for
+// any number. The optional key "MaxItems" (a positive integer) caps the number of items in total.
 // The host's items are a dictionary whose "items" is an array of type identifiers, one per item;
 // its other keys are ignored.
 class ActivationRule {

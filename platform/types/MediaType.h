@@ -16,7 +16,7 @@ class MediaType {
   static std::optional<std::string> concrete(std::string_view text);
 
   // |text| in lower case when it is a wildcard "major/*" whose major name is as above; nothing
-  // otherwise ("*/*" included).
+  // otherwise ("*/*" included: TypeRegistry gives it its own meaning).
   static std::optional<std::string> wildcard(std::string_view text);
 
   // The major name of a type returned by concrete() or wildcard(): "image" of "image/png".

@@ -72,6 +72,15 @@ void parsePairs(const std::string& path, const std::string& contents,
   }
 }
 
+// The list under |type|, or an empty one.
+const std::vector<std::string>& listAt(
+    const std::unordered_map<std::string, std::vector<std::string>>& lists,
+    const std::string& type) {
+  static const std::vector<std::string> kNone;
+  auto found = lists.find(type);
+  return found == lists.end() ? kNone : found->second;
+}
+
 }  // namespace
 
 bool MimeDatabase::FileStamp::operator==(const FileStamp& other) const {
@@ -119,7 +128,11 @@ std::shared_ptr<const MimeDatabase> MimeDatabase::read(const std::string& direct
   std::shared_ptr<MimeDatabase> database(new MimeDatabase(directory));
   Pairs aliases;
   database->aliasesStamp_ = readPairs(directory + "/aliases", aliases);
-  for (auto& [alias, canonical] : aliases) database->aliases_.emplace(alias, canonical);
+  for (auto& [alias, canonical] : aliases) {
+    if (database->aliases_.emplace(alias, canonical).second) {
+      database->aliasesOf_[canonical].push_back(alias);
+    }
+  }
   Pairs subclasses;
   database->subclassesStamp_ = readPairs(directory + "/subclasses", subclasses);
   for (const auto& [child, parent] : subclasses) {
@@ -139,9 +152,11 @@ std::string MimeDatabase::canonical(const std::string& type) const {
 }
 
 const std::vector<std::string>& MimeDatabase::parents(const std::string& type) const {
-  static const std::vector<std::string> kNone;
-  auto found = parents_.find(type);
-  return found == parents_.end() ? kNone : found->second;
+  return listAt(parents_, type);
+}
+
+const std::vector<std::string>& MimeDatabase::aliases(const std::string& type) const {
+  return listAt(aliasesOf_, type);
 }
 
 }  // namespace types

@@ -40,6 +40,10 @@ class MimeDatabase {
   // has none.
   const std::vector<std::string>& parents(const std::string& type) const;
 
+  // The aliases whose canonical name is the lower-case type |type|, in file order; empty when it
+  // has none.
+  const std::vector<std::string>& aliases(const std::string& type) const;
+
  private:
   // What identifies one version of a file; all zero for a file that is missing.
   struct FileStamp {
@@ -65,6 +69,7 @@ class MimeDatabase {
   FileStamp aliasesStamp_;
   FileStamp subclassesStamp_;
   std::unordered_map<std::string, std::string> aliases_;
+  std::unordered_map<std::string, std::vector<std::string>> aliasesOf_;
   std::unordered_map<std::string, std::vector<std::string>> parents_;
 };
 

@@ -1,5 +1,6 @@
 #include "platform/types/TypeRegistry.h"
 
+#include <algorithm>
 #include <deque>
 #include <optional>
 #include <string_view>
@@ -16,6 +17,7 @@ namespace {
 
 constexpr std::string_view kPlainText = "text/plain";
 constexpr std::string_view kAnyData = "application/octet-stream";
+constexpr std::string_view kAnyType = "*/*";
 
 MimeDatabaseCache& cache() {
   // Never destroyed: other threads may still ask while the process exits.
@@ -32,43 +34,54 @@ bool equalIgnoringCase(std::string_view a, std::string_view b) {
   return true;
 }
 
-// What a type must reach: a canonical concrete type, or every type of one major name.
-struct Target {
-  std::string type;
-  bool isWildcard = false;
-
-  bool reachedBy(std::string_view node) const {
-    return isWildcard ? MediaType::major(node) == MediaType::major(type) : node == type;
-  }
-};
-
-std::optional<Target> targetFor(const std::string& to, const MimeDatabase& database) {
-  if (auto wildcard = MediaType::wildcard(to)) return Target{std::move(*wildcard), true};
-  if (auto concrete = MediaType::concrete(to)) return Target{database.canonical(*concrete), false};
-  return std::nullopt;
-}
-
-// The types |node| conforms to directly: its declared parents and the built-in ones.
-std::vector<std::string> directParents(const MimeDatabase& database, const std::string& node) {
-  std::vector<std::string> parents = database.parents(node);
-  if (MediaType::major(node) == MediaType::major(kPlainText)) parents.emplace_back(kPlainText);
-  parents.emplace_back(kAnyData);
-  return parents;
-}
-
-// Breadth-first over everything |start| conforms to; the visited set ends cycles in the file.
-bool reaches(const MimeDatabase& database, std::string start, const Target& target) {
+// Breadth-first over |start| and, transitively, the types |parentsOf| gives, until |found| holds
+// for one; the visited set ends cycles in the file.
+template <typename Parents, typename Found>
+bool anyReached(std::string start, const Parents& parentsOf, const Found& found) {
   std::unordered_set<std::string> visited{start};
   std::deque<std::string> pending{std::move(start)};
   while (!pending.empty()) {
     std::string node = std::move(pending.front());
     pending.pop_front();
-    if (target.reachedBy(node)) return true;
-    for (std::string& parent : directParents(database, node)) {
+    if (found(node)) return true;
+    for (std::string& parent : parentsOf(node)) {
       if (visited.insert(parent).second) pending.push_back(std::move(parent));
     }
   }
   return false;
+}
+
+// True when the canonical |type| conforms to the canonical concrete |target|: through declared
+// parents and the built-in ones, "text/plain" for every "text/..." type and
+// "application/octet-stream" for every type.
+bool reachesType(const MimeDatabase& database, const std::string& type, const std::string& target) {
+  auto parents = [&](const std::string& node) {
+    std::vector<std::string> all = database.parents(node);
+    if (MediaType::major(node) == MediaType::major(kPlainText)) all.emplace_back(kPlainText);
+    all.emplace_back(kAnyData);
+    return all;
+  };
+  return anyReached(type, parents, [&](const std::string& node) { return node == target; });
+}
+
+// True when the canonical |type|, one of its aliases, or a declared parent (transitively, with
+// its aliases) has the major name |major|. The universal parents are not followed: every type
+// reaches them, so they would put every type under "application/*" and "text/*".
+bool underMajor(const MimeDatabase& database, const std::string& type, std::string_view major) {
+  auto parents = [&](const std::string& node) {
+    std::vector<std::string> declared;
+    for (const std::string& parent : database.parents(node)) {
+      if (parent != kPlainText && parent != kAnyData) declared.push_back(parent);
+    }
+    return declared;
+  };
+  auto named = [&](const std::string& node) {
+    if (MediaType::major(node) == major) return true;
+    const std::vector<std::string>& aliases = database.aliases(node);
+    return std::any_of(aliases.begin(), aliases.end(),
+                       [&](const std::string& alias) { return MediaType::major(alias) == major; });
+  };
+  return anyReached(type, parents, named);
 }
 
 }  // namespace
@@ -77,10 +90,15 @@ bool TypeRegistry::conforms(const std::string& type, const std::string& to) {
   if (equalIgnoringCase(type, to)) return true;
   std::optional<std::string> from = MediaType::concrete(type);
   if (!from) return false;
+  if (to == kAnyType) return true;
   std::shared_ptr<const MimeDatabase> database =
       cache().databaseFor(os::Paths::underRoot("usr/share/mime"));
-  std::optional<Target> target = targetFor(to, *database);
-  return target && reaches(*database, database->canonical(*from), *target);
+  std::string canonical = database->canonical(*from);
+  if (std::optional<std::string> wildcard = MediaType::wildcard(to)) {
+    return underMajor(*database, canonical, MediaType::major(*wildcard));
+  }
+  std::optional<std::string> target = MediaType::concrete(to);
+  return target && reachesType(*database, canonical, database->canonical(*target));
 }
 
 }  // namespace types

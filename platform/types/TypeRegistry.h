@@ -16,13 +16,14 @@ class TypeRegistry {
   // True when |type| conforms to |to|; false otherwise, never an error. The rules:
   //  - every string conforms to itself (compared case-insensitively), well-formed or not;
   //  - apart from that, |type| must be a concrete media type (MediaType::concrete) and |to| a
-  //    concrete one or a wildcard "major/*", or the answer is false;
+  //    concrete one, a wildcard "major/*" or "*/*", or the answer is false;
   //  - aliases are resolved on both sides first;
   //  - a type conforms to its parents in the sub-class file, transitively; every "text/..." type
   //    to "text/plain"; every type to "application/octet-stream";
-  //  - a type conforms to "major/*" when it, or any type it conforms to, has that major name.
-  //    Since everything conforms to "application/octet-stream", everything conforms to
-  //    "application/*" too.
+  //  - a type conforms to "major/*" when it, one of its aliases, or a parent in the sub-class
+  //    file (transitively, aliases included) has that major name; "text/plain" and
+  //    "application/octet-stream" count only as the type itself, since every type reaches them;
+  //  - every concrete type conforms to "*/*".
   static bool conforms(const std::string& type, const std::string& to);
 };
 

@@ -154,6 +154,47 @@ TEST_F(RegistrationTest, AnnotateChecksEveryFieldBeforeStoringAnything) {
             Value::dictionary({{"election", Value::integer(2)}}));
 }
 
+TEST_F(RegistrationTest, AForeignAnnotationEntryCostsNoElection) {
+  const Dictionary second{{"election", Value::integer(3)},
+                          {"extension", Value::dictionary({{"k", Value::string("v")}})}};
+  bundles::writePlist(
+      file_, Value::dictionary({
+                 {"version", Value::integer(16)},
+                 {"data", Value::dictionary({
+                              {"kept.first", Value::dictionary({{"election", Value::integer(1)}})},
+                              {"foreign", Value::string("not an annotation")},
+                              {"kept.second", Value::dictionary(second)},
+                          })},
+             }));
+  ASSERT_TRUE(start({"-d", file_}));
+  install("kept.first");
+  value::Uuid uuid = install("kept.second");
+  EXPECT_EQ(logCount("skipping annotation \"foreign\" of " + file_ + ": not a dictionary"), 1u);
+  EXPECT_EQ(logCount("unable to load annotation database"), 0u);
+  auto elected = [&](const char* election) {
+    std::vector<std::string> ids;
+    for (const Value& form :
+         match(Value::dictionary({{"QSUserElection", Value::string(election)}}))) {
+      ids.push_back(*form.asDictionary()->find("identifier")->asString());
+    }
+    return ids;
+  };
+  EXPECT_EQ(elected("1"), std::vector<std::string>{"kept.first"});
+  EXPECT_EQ(elected("3"), std::vector<std::string>{"kept.second"});
+
+  // The next save keeps every election; only the foreign entry is gone.
+  ASSERT_EQ(annotate({uuid}, {{"election", Value::integer(2)}}), "ok");
+  auto written = value::PropertyList::readFile(file_);
+  ASSERT_TRUE(written.ok()) << written.error().message;
+  const Value* data = written.value().asDictionary()->find("data");
+  ASSERT_TRUE(data);
+  EXPECT_EQ(*data,
+            Value::dictionary({
+                {"kept.first", Value::dictionary({{"election", Value::integer(1)}})},
+                {"kept.second", Value::dictionary(second.with("election", Value::integer(2)))},
+            }));
+}
+
 TEST_F(RegistrationTest, WatchSeesTheChanges) {
   ASSERT_TRUE(start());
   value::Uuid uuid = install("watched");

@@ -25,7 +25,8 @@ class TypeRegistryTest : public ::testing::Test {
                 "application/xml text/plain\nimage/svg+xml application/xml\n"
                 "text/x-chdr text/x-c\n# comment\n\nx-loop/a x-loop/b\nx-loop/b x-loop/a\n"
                 "x-loop/c x-loop/c\nImage/X-Portable-Bitmap IMAGE/x-portable-anymap\n"
-                "one-field\na/b c/d e/f\nnot a/type\ninode/x-late image/png\n");
+                "one-field\na/b c/d e/f\nnot a/type\ninode/x-late image/png\n"
+                "text/x-csv text/plain\napplication/x-shellscript text/plain\n");
     root_.write("usr/share/mime/aliases",
                 "image/jpg image/jpeg\ntext/xml application/xml\n"
                 "text/x-c text/x-csrc\n");
@@ -47,17 +48,37 @@ TEST_F(TypeRegistryTest, Conformance) {
       {"text/plain; charset=utf-8", "text/plain", false},
       {"a/b/c", "a/*", false},
       {"image/*", "image/png", false},
-      {"image/png", "*/*", false},         // no target
+      {"image/*", "*/*", false},
+      {"*/*", "*/*", true},
       {"text/x-foo", "text/plain", true},  // built in
       {"text/plain", "text/x-foo", false},
       {"image/png", "application/octet-stream", true},
-      {"image/svg+xml", "TEXT/*", true},  // two steps through the file, then built in
-      {"image/svg+xml", "audio/*", false},
       {"image/jpeg", "IMAGE/JPG", true},
       {"text/xml", "text/plain", true},
       {"text/x-chdr", "text/x-csrc", true},  // the parent in the file is an alias
       {"x-loop/a", "image/png", false},
       {"image/x-portable-bitmap", "image/x-portable-anymap", true},
+      // Wildcards: the type, its aliases and its declared parents count; the universal parents
+      // only as the type itself.
+      {"image/png", "application/*", false},
+      {"image/png", "*/*", true},
+      {"application/octet-stream", "application/*", true},
+      {"text/plain", "text/*", true},
+      {"text/x-csv", "text/plain", true},
+      {"text/x-csv", "text/*", true},
+      {"text/x-csv", "application/*", false},
+      {"application/x-shellscript", "text/plain", true},
+      {"application/x-shellscript", "text/*", false},
+      {"image/jpg", "image/*", true},       // an alias
+      {"application/xml", "text/*", true},  // through its alias text/xml
+      {"text/xml", "application/*", true},  // an alias of application/xml
+      {"image/svg+xml", "application/*", true},
+      {"image/svg+xml", "TEXT/*", true},  // its parent's alias
+      {"image/svg+xml", "audio/*", false},
+      {"x-unknown/thing", "x-unknown/*", true},  // a type the database does not know
+      {"x-unknown/thing", "*/*", true},
+      {"x-unknown/thing", "application/*", false},
+      {"x-unknown/thing", "application/octet-stream", true},
       {"inode/x-late", "image/*", true},  // malformed lines are skipped, not fatal
   };
   for (const Case& c : cases) {
@@ -111,6 +132,13 @@ TEST_F(TypeRegistryTest, ActivationRules) {
       {rule({{"image/png", one}, {"MaxItems", any}}), {"image/png"}, false},
       {rule({{"MaxItems", one}}), {"image/png"}, false},
       {Value::array({}), {"image/png"}, false},
+      // Wildcards: "application/*" is no catch-all, "*/*" is.
+      {rule({{"application/*", any}}), {"image/png"}, false},
+      {rule({{"application/*", any}}), {"text/xml", "application/pdf"}, true},
+      {rule({{"text/*", any}}), {"text/x-csv", "application/x-shellscript"}, false},
+      {rule({{"*/*", two}}), {"image/png", "x-unknown/thing"}, true},
+      {rule({{"*/*", one}}), {"image/png", "x-unknown/thing"}, false},
+      {rule({{"*/*", any}}), {"image/png", "not a type"}, false},
   };
   for (std::size_t i = 0; i < std::size(cases); ++i) {
     EXPECT_EQ(ActivationRule::evaluate(cases[i].rule, items(cases[i].items)), cases[i].expected)
