@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <cstdint>
 
+#include "Annexa/AXUtilities.h"
 #include "axd/AXDNames.h"
 
 namespace {
@@ -20,13 +21,6 @@ bool beginsWithLetterMarkOrDigit(const std::string& text) {
   U8_NEXT(text.data(), offset, static_cast<std::int32_t>(text.size()), first);
   if (first < 0) return false;
   return (U_GET_GC_MASK(first) & (U_GC_L_MASK | U_GC_M_MASK | U_GC_N_MASK)) != 0;
-}
-
-std::optional<std::int64_t> numericElection(const std::optional<value::Dictionary>& annotation) {
-  if (!annotation) return std::nullopt;
-  const value::Value* election = annotation->find(kElection);
-  if (!election || !election->isNumber()) return std::nullopt;
-  return election->integerValue();
 }
 
 bool autoElects(const value::Dictionary& entitlements) {
@@ -69,11 +63,15 @@ std::optional<std::string> AXDElectionFilter::normalizedPattern(const value::Val
 
 std::string AXDElectionFilter::electionText(const std::optional<value::Dictionary>& annotation,
                                             const value::Dictionary& entitlements) {
-  std::optional<std::int64_t> election = numericElection(annotation);
-  std::int64_t chosen = election ? *election : (autoElects(entitlements) ? 1 : 0);
-  return std::to_string(static_cast<std::uint8_t>(chosen));
+  const value::Value* entry = annotation ? annotation->find(kElection) : nullptr;
+  std::int64_t election = entry ? entry->integerValue().value_or(0) : 0;
+  // Building the record stores election 1 for an auto-electing plug-in without one.
+  if (election == 0 && autoElects(entitlements)) election = 1;
+  return std::to_string(election & ~std::int64_t{0xFF00});
 }
 
 bool AXDElectionFilter::accepts(const std::string& text) const {
-  return std::find(elections_.begin(), elections_.end(), text) != elections_.end();
+  return std::any_of(elections_.begin(), elections_.end(), [&](const std::string& election) {
+    return compareVersionString(text, election) == 0;
+  });
 }

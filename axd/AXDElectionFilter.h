@@ -8,8 +8,10 @@
 #include "platform/value/Value.h"
 
 // The election restriction of a discovery rule: its "QSUserElection" entry as a list of election
-// texts, each the decimal form of an election's low 8 bits ("1", "255"). A candidate passes when
-// its own election text is one of them. Immutable; safe to share between threads.
+// texts, checked before a candidate's record is built. It must never reject a candidate that the
+// rule itself would match, so it reads the election as the rule does (bits 8 to 15 cleared, in
+// decimal) and compares as the rule does (numeric-aware equality). Immutable; safe to share
+// between threads.
 class AXDElectionFilter {
  public:
   // The restriction of |rule|, or nothing when the rule places none: no "QSUserElection" entry,
@@ -23,13 +25,13 @@ class AXDElectionFilter {
   static std::optional<std::string> normalizedPattern(const value::Value& pattern);
 
   // The election text of a candidate with |annotation| and plug-in |entitlements|: the
-  // annotation's numeric "election" reduced to its low 8 bits, in decimal. Without a numeric
-  // election: "1" when the auto-elect entitlement is a true boolean or a non-zero number,
-  // else "0".
+  // annotation's "election" read as an integer (a number or boolean; anything else is 0) with
+  // bits 8 to 15 cleared, in decimal. An election of 0 becomes 1 when the auto-elect entitlement
+  // is a true boolean or a non-zero number, as building the record will store.
   static std::string electionText(const std::optional<value::Dictionary>& annotation,
                                   const value::Dictionary& entitlements);
 
-  // True when |text| equals one of the restriction's texts exactly.
+  // True when |text| equals one of the restriction's texts by the numeric-aware comparison.
   bool accepts(const std::string& text) const;
 
   const std::vector<std::string>& elections() const { return elections_; }

@@ -32,7 +32,8 @@ TEST(AXDElectionFilterTest, PatternsAreNormalisedByTheirFirstCharacter) {
   }
 }
 
-TEST(AXDElectionFilterTest, TheElectionTextIsTheLowByteOrTheAutoElectDefault) {
+// The filter runs before the rule: any election the rule would match must pass it.
+TEST(AXDElectionFilterTest, TheElectionTextIsWhatTheRuleReads) {
   const Dictionary none;
   auto elected = [](Value election) { return Dictionary{{"election", election}}; };
   auto entitled = [](Value value) { return Dictionary{{AXDNames::kAutoElectEntitlement, value}}; };
@@ -42,9 +43,13 @@ TEST(AXDElectionFilterTest, TheElectionTextIsTheLowByteOrTheAutoElectDefault) {
     std::string expected;
   } cases[] = {
       {elected(Value::integer(1)), none, "1"},
-      {elected(Value::integer(-1)), none, "255"},
+      {elected(Value::integer(257)), none, "1"},
+      {elected(Value::integer(65537)), none, "65537"},
+      {elected(Value::integer(-1)), none, "-65281"},
       {elected(Value::real(2.7)), none, "2"},
-      {elected(Value::integer(0)), entitled(Value::boolean(true)), "0"},
+      {elected(Value::boolean(true)), none, "1"},
+      {elected(Value::string("1")), none, "0"},
+      {elected(Value::integer(0)), entitled(Value::boolean(true)), "1"},
       {std::nullopt, entitled(Value::boolean(true)), "1"},
       {std::nullopt, entitled(Value::integer(2)), "1"},
       {std::nullopt, entitled(Value::string("yes")), "0"},
@@ -54,6 +59,10 @@ TEST(AXDElectionFilterTest, TheElectionTextIsTheLowByteOrTheAutoElectDefault) {
     SCOPED_TRACE(c.expected);
     EXPECT_EQ(AXDElectionFilter::electionText(c.annotation, c.entitlements), c.expected);
   }
+  std::optional<AXDElectionFilter> leadingZero = AXDElectionFilter::fromRule(
+      Dictionary{{"QSUserElection", Value::array({Value::string("01")})}});
+  ASSERT_TRUE(leadingZero);
+  EXPECT_TRUE(leadingZero->accepts("1"));
 }
 
 }  // namespace

@@ -106,9 +106,9 @@ TEST_F(AXDatabaseTest, TheElectionEntryRestrictsTheQuery) {
     std::set<std::string> expected;
   } cases[] = {
       {S("1"), {"elect.one"}},
-      {S("01"), {}},
-      {S("-1"), all},  // invalid: no restriction
-      {S("255"), {"elect.minus"}},
+      {S("01"), {"elect.one"}},  // numeric-aware, as the rule compares
+      {S("-1"), all},            // invalid: no restriction
+      {S("255"), {}},            // -1 with bits 8 to 15 cleared is -65281, as the rule reads it
       {Value::array({S("1"), S("=0")}), {"elect.one", "elect.zero", "elect.none"}},
       {Value::array({S("1"), S("")}), all},
       {Value::array({}), {}},
