@@ -38,6 +38,17 @@ bool AXDatabase::initWithDatabase(const char* path) {
   return true;
 }
 
+void AXDatabase::noteSdkChanges() {
+  std::uint64_t generation = workspace_->sdkGeneration();
+  _sync.sync([&] {
+    if (generation <= sdkGeneration_) return;
+    sdkGeneration_ = generation;
+    if (!cache_.empty())
+      os::Log::notice("SDKs changed: dropping %d cached plug-ins", {cache_.size()});
+    cache_.clear();
+  });
+}
+
 std::shared_ptr<AXDPlugIn> AXDatabase::plugInForProxy(
     const std::shared_ptr<const registrum::PlugInRecord>& rgData) {
   return _sync.sync([&]() -> std::shared_ptr<AXDPlugIn> {
@@ -53,6 +64,7 @@ std::shared_ptr<AXDPlugIn> AXDatabase::createPlugInForProxy(
   std::shared_ptr<AXDPlugIn> plugIn = AXDPlugIn::initWithRGData(rgData);
   if (!plugIn) return nullptr;
   if (plugIn->hasEntitlement(AXDNames::kAutoElectEntitlement)) autoElect(*plugIn);
+  if (rgData->sdkGeneration() < sdkGeneration_) return plugIn;
   purgeCachesToLimit(cacheLimit_);
   cache_[*plugIn->uuid()] = plugIn;
   return plugIn;

@@ -41,11 +41,17 @@ class AXDatabase : public registrum::Observer, public std::enable_shared_from_th
 
   // ---- Lookups (null: nothing) ----------------------------------------------------------------
 
+  // Empties the cache when an SDK was added, changed or removed since the last call: a cached
+  // record keeps the plug-in dictionary it was built with. Costs one system call (the registry
+  // takes its queued SDK changes); called once at the start of each request. Takes _sync.
+  void noteSdkChanges();
+
   // The cached record of |rgData|, else a new one (createPlugInForProxy). Takes _sync.
   std::shared_ptr<AXDPlugIn> plugInForProxy(
       const std::shared_ptr<const registrum::PlugInRecord>& rgData);
   // Builds, auto-elects and caches the record of |rgData|; null (nothing cached) when it cannot
-  // be built. The caller must be on _sync: anywhere else it is an internal-consistency failure.
+  // be built. A registry record read before the last SDK change noticed is served but not cached.
+  // The caller must be on _sync: anywhere else it is an internal-consistency failure.
   std::shared_ptr<AXDPlugIn> createPlugInForProxy(
       const std::shared_ptr<const registrum::PlugInRecord>& rgData);
   // Empties the whole cache when it holds more than |limit| records (logged). Runs on _sync.
@@ -111,6 +117,7 @@ class AXDatabase : public registrum::Observer, public std::enable_shared_from_th
   registrum::Workspace::Filter electionFilter(const value::Dictionary& rule);
 
   std::uint32_t cacheLimit_ = 0;
+  std::uint64_t sdkGeneration_ = 0;  // the registry's, when last noted; on _sync
   std::weak_ptr<AXDatabaseDelegate> delegate_;
   std::shared_ptr<registrum::Workspace> workspace_;
   std::unique_ptr<AXDAnnotationStore> annotations_;

@@ -51,6 +51,7 @@ void Transaction::dispatch() {
     return;
   }
   if (!client_->acceptWork()) return;
+  server()->noteSdkChanges();
   pid_t pid = client_->pid();
   const char* typeText = type ? type->c_str() : nullptr;
   server()->debug("client %d request %s", {pid, typeText});

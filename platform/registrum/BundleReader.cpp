@@ -42,11 +42,11 @@ os::Result<PlugInBundle> BundleReader::readPlugIn(const std::string& path) {
   return bundle;
 }
 
-os::Result<std::vector<PlugInBundle>> BundleReader::readPlugInsOf(
+os::Result<std::vector<std::string>> BundleReader::plugInPathsOf(
     const std::string& applicationPath) {
   std::string directory = applicationPath + "/PlugIns";
   std::error_code error;
-  std::vector<std::filesystem::path> paths;
+  std::vector<std::string> paths;
   for (std::filesystem::directory_iterator it(directory, error), end; !error && it != end;
        it.increment(error)) {
     std::error_code typeError;
@@ -58,13 +58,7 @@ os::Result<std::vector<PlugInBundle>> BundleReader::readPlugInsOf(
     return os::Error{error.value(), "cannot list " + directory + ": " + error.message()};
   }
   std::sort(paths.begin(), paths.end());
-  std::vector<PlugInBundle> bundles;
-  for (const auto& path : paths) {
-    os::Result<PlugInBundle> bundle = readPlugIn(path.string());
-    if (!bundle.ok()) return bundle.error();
-    bundles.push_back(std::move(bundle.value()));
-  }
-  return bundles;
+  return paths;
 }
 
 os::Result<std::string> BundleReader::bundleDirectory(const std::string& path) {

@@ -27,10 +27,10 @@ class BundleReader {
   // The plug-in bundle at |path|.
   static os::Result<PlugInBundle> readPlugIn(const std::string& path);
 
-  // The plug-in bundles of the application directory |applicationPath|: every directory in
-  // its "PlugIns/" whose name does not start with '.', in name order. No "PlugIns/" is none;
-  // the first bundle that cannot be read fails the whole list.
-  static os::Result<std::vector<PlugInBundle>> readPlugInsOf(const std::string& applicationPath);
+  // The bundle paths of the application directory |applicationPath|: every directory in its
+  // "PlugIns/" whose name does not start with '.', in name order. No "PlugIns/" is none; fails
+  // when "PlugIns/" cannot be listed.
+  static os::Result<std::vector<std::string>> plugInPathsOf(const std::string& applicationPath);
 
   // The canonical path of the bundle directory at |path|.
   static os::Result<std::string> bundleDirectory(const std::string& path);

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <memory>
 #include <optional>
 #include <string>
@@ -41,6 +42,7 @@ class PlugInRecord {
     value::Dictionary infoDictionary;
     std::optional<std::string> localizedName;
     std::optional<std::string> localizedShortName;
+    std::uint64_t sdkGeneration = 0;
   };
 
   explicit PlugInRecord(Fields fields) : fields_(std::move(fields)) {}
@@ -84,8 +86,9 @@ class PlugInRecord {
   // The plug-in's data container "<root>/var/containers/<UUID>"; nothing for a plug-in
   // registered without one.
   const std::optional<std::string>& dataContainerPath() const { return fields_.dataContainerPath; }
-  // Info.plist's "QSExtension" resolved against its extension point's SDK dictionary, with the
-  // attributes and version defaults filled (sdk::SdkRegistry::resolve).
+  // Info.plist's "QSExtension" resolved against its extension point's SDK dictionary as it was
+  // when the record was read, with the attributes and version defaults filled
+  // (sdk::SdkCache::resolve).
   const value::Dictionary& plugInDictionary() const { return fields_.plugInDictionary; }
   // The bundle's Info.plist as read, before SDK resolution.
   const value::Dictionary& infoDictionary() const { return fields_.infoDictionary; }
@@ -97,6 +100,11 @@ class PlugInRecord {
   const std::optional<std::string>& localizedShortName() const {
     return fields_.localizedShortName;
   }
+
+  // The SDK generation (Workspace::sdkGeneration) when the record was read: its plug-in
+  // dictionary reflects the SDKs of that generation or a later one. 0 in the records of notices
+  // and in records built by hand.
+  std::uint64_t sdkGeneration() const { return fields_.sdkGeneration; }
 
   // The value under |key| in |scope|, of any type; nothing when the key is absent (or, for
   // Attributes, when the plug-in dictionary has no attributes dictionary).

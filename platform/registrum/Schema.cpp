@@ -1,6 +1,7 @@
 #include "platform/registrum/Schema.h"
 
 #include <cerrno>
+#include <iterator>
 
 namespace registrum {
 
@@ -25,8 +26,7 @@ CREATE TABLE IF NOT EXISTS plugins (
   on_system_partition INTEGER NOT NULL,
   data_container TEXT,
   entitlements BLOB NOT NULL,
-  info BLOB NOT NULL,
-  plugin_dictionary BLOB NOT NULL
+  info BLOB NOT NULL
 );
 CREATE INDEX IF NOT EXISTS plugins_by_identifier ON plugins(plugin_identifier);
 CREATE INDEX IF NOT EXISTS plugins_by_rule_point ON plugins(rule_point);
@@ -37,6 +37,24 @@ CREATE TABLE IF NOT EXISTS changes (
   records BLOB NOT NULL
 );
 )sql";
+
+// What brings a database of version i + 1 to version i + 2.
+constexpr const char* kMigrations[] = {
+    // The plug-in dictionary is resolved against the SDKs at every read, so that an SDK added,
+    // changed or removed later counts; the copy resolved at registration goes.
+    "ALTER TABLE plugins DROP COLUMN plugin_dictionary",
+};
+static_assert(std::size(kMigrations) == Schema::kVersion - 1);
+
+os::Status migrate(Database& db, std::int64_t version) {
+  for (std::int64_t step = version; step < Schema::kVersion; ++step) {
+    os::Status migrated = db.execute(kMigrations[step - 1]);
+    if (!migrated.ok()) return migrated;
+  }
+  os::Result<Statement> update = db.prepare("UPDATE schema_version SET version = ?");
+  if (!update.ok()) return update.error();
+  return update.value().bind(1, std::int64_t{Schema::kVersion}).run();
+}
 
 os::Status checkVersion(Database& db) {
   os::Result<Statement> select = db.prepare("SELECT version FROM schema_version");
@@ -50,6 +68,7 @@ os::Status checkVersion(Database& db) {
   }
   std::int64_t version = select.value().integer(0);
   if (version == Schema::kVersion) return os::success();
+  if (version >= 1 && version < Schema::kVersion) return migrate(db, version);
   return os::Error{EIO, "registry database has schema version " + std::to_string(version) +
                             ", this program reads version " + std::to_string(Schema::kVersion)};
 }

@@ -9,12 +9,14 @@ namespace registrum {
 // and the schema version. Stateless.
 class Schema {
  public:
-  static constexpr int kVersion = 1;
+  // 2: plug-in rows keep no resolved plug-in dictionary.
+  static constexpr int kVersion = 2;
   // The change log keeps this many newest entries; older ones are trimmed at each change.
   static constexpr int kChangesKept = 1000;
 
-  // Creates the tables in |db| when they are missing, in one transaction, so that processes
-  // opening a new database at once agree. Fails with EIO for a database of another version.
+  // Creates the tables in |db| when they are missing and brings a database of an earlier version
+  // to this one, in one transaction, so that processes opening a database at once agree. Fails
+  // with EIO for a database of a later (or unknown) version.
   static os::Status ensure(Database& db);
 };
 

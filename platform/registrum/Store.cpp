@@ -10,13 +10,13 @@ namespace registrum {
 
 namespace {
 
-// Plug-in columns 0-7, then the application's columns 8-12 (all NULL without one).
+// Plug-in columns 0-6, then the application's columns 7-11 (all NULL without one).
 constexpr const char* kPlugInSelect =
     "SELECT p.uuid, p.path, p.registration_date, p.on_system_partition, p.data_container, "
-    "p.entitlements, p.info, p.plugin_dictionary, "
+    "p.entitlements, p.info, "
     "a.path, a.bundle_identifier, a.bundle_version, a.localized_name, a.placeholder "
     "FROM plugins p LEFT JOIN applications a ON a.path = p.application_path ";
-constexpr int kApplicationColumn = 8;
+constexpr int kApplicationColumn = 7;
 
 constexpr const char* kApplicationSelect =
     "SELECT path, bundle_identifier, bundle_version, localized_name, placeholder "
@@ -28,12 +28,13 @@ os::Error corrupt(const std::string& what, const os::Error& cause) {
 
 }  // namespace
 
-os::Result<std::unique_ptr<Store>> Store::open(const std::string& path) {
+os::Result<std::unique_ptr<Store>> Store::open(const std::string& path,
+                                               std::shared_ptr<sdk::SdkCache> sdks) {
   os::Result<std::unique_ptr<Database>> db = Database::open(path);
   if (!db.ok()) return db.error();
   os::Status schema = Schema::ensure(*db.value());
   if (!schema.ok()) return schema.error();
-  return std::unique_ptr<Store>(new Store(std::move(db.value())));
+  return std::unique_ptr<Store>(new Store(std::move(db.value()), std::move(sdks)));
 }
 
 os::Result<std::shared_ptr<const ApplicationRecord>> Store::application(const std::string& path) {
@@ -107,8 +108,8 @@ os::Status Store::putApplication(const ApplicationRecord::Fields& fields) {
 os::Status Store::putPlugIn(const PlugInRecord::Fields& fields) {
   os::Result<Statement> upsert = db_->prepare(
       "INSERT OR REPLACE INTO plugins (uuid, path, application_path, plugin_identifier, "
-      "rule_point, registration_date, on_system_partition, data_container, entitlements, info, "
-      "plugin_dictionary) VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?)");
+      "rule_point, registration_date, on_system_partition, data_container, entitlements, info) "
+      "VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?)");
   if (!upsert.ok()) return upsert.error();
   std::optional<std::string> application;
   if (fields.containingApplication) application = fields.containingApplication->path();
@@ -123,7 +124,6 @@ os::Status Store::putPlugIn(const PlugInRecord::Fields& fields) {
       .bind(8, fields.dataContainerPath)
       .bind(9, RecordCodec::encodeDictionary(fields.entitlements))
       .bind(10, RecordCodec::encodeDictionary(fields.infoDictionary))
-      .bind(11, RecordCodec::encodeDictionary(fields.plugInDictionary))
       .run();
 }
 
@@ -188,25 +188,28 @@ os::Result<std::shared_ptr<const PlugInRecord>> Store::onePlugIn(const std::stri
       db_->prepare(std::string(kPlugInSelect) + "WHERE " + where + " = ?");
   if (!select.ok()) return select.error();
   select.value().bind(1, key);
+  std::uint64_t sdkGeneration = sdks_->refresh();
   os::Result<bool> row = select.value().step();
   if (!row.ok()) return row.error();
   if (!row.value()) return std::shared_ptr<const PlugInRecord>();
-  return plugInRow(select.value());
+  return plugInRow(select.value(), sdkGeneration);
 }
 
 os::Result<PlugInList> Store::plugInRows(Statement& statement) {
+  std::uint64_t sdkGeneration = sdks_->refresh();
   PlugInList plugIns;
   for (;;) {
     os::Result<bool> row = statement.step();
     if (!row.ok()) return row.error();
     if (!row.value()) return plugIns;
-    os::Result<std::shared_ptr<const PlugInRecord>> record = plugInRow(statement);
+    os::Result<std::shared_ptr<const PlugInRecord>> record = plugInRow(statement, sdkGeneration);
     if (!record.ok()) return record.error();
     plugIns.push_back(std::move(record.value()));
   }
 }
 
-os::Result<std::shared_ptr<const PlugInRecord>> Store::plugInRow(const Statement& row) {
+os::Result<std::shared_ptr<const PlugInRecord>> Store::plugInRow(const Statement& row,
+                                                                 std::uint64_t sdkGeneration) {
   PlugInRecord::Fields fields;
   std::string uuid = row.text(0);
   std::optional<value::Uuid> parsed = value::Uuid::parse(uuid);
@@ -216,13 +219,19 @@ os::Result<std::shared_ptr<const PlugInRecord>> Store::plugInRow(const Statement
   fields.registrationDate = row.real(2);
   fields.onSystemPartition = row.integer(3) != 0;
   fields.dataContainerPath = row.optionalText(4);
-  value::Dictionary* blobs[] = {&fields.entitlements, &fields.infoDictionary,
-                                &fields.plugInDictionary};
-  for (int i = 0; i < 3; ++i) {
+  value::Dictionary* blobs[] = {&fields.entitlements, &fields.infoDictionary};
+  for (int i = 0; i < 2; ++i) {
     os::Result<value::Dictionary> decoded = RecordCodec::decodeDictionary(row.blob(5 + i));
     if (!decoded.ok()) return corrupt("plug-in " + uuid, decoded.error());
     *blobs[i] = decoded.value();
   }
+  value::Dictionary resolved = sdks_->resolve(fields.infoDictionary);
+  const value::Value* plugIn = resolved.find("QSExtension");
+  if (!plugIn || !plugIn->asDictionary()) {
+    return os::Error{EIO, "registry database: plug-in " + uuid + " has no \"QSExtension\""};
+  }
+  fields.plugInDictionary = *plugIn->asDictionary();
+  fields.sdkGeneration = sdkGeneration;
   if (!row.isNull(kApplicationColumn)) {
     fields.containingApplication = applicationRow(row, kApplicationColumn);
   }

@@ -9,11 +9,14 @@
 #include "platform/os/Error.h"
 #include "platform/registrum/Database.h"
 #include "platform/registrum/Observer.h"
+#include "platform/sdk/SdkCache.h"
 
 namespace registrum {
 
 // The registry's rows over one database connection: reads and writes of applications, plug-ins
-// and the change log. Not thread-safe: its owner serialises every call (Workspace's mutex, or
+// and the change log. A plug-in row holds the bundle's own Info.plist; each read resolves its
+// plug-in dictionary against the SDKs as they are then (one SdkCache::refresh() per read, so no
+// system call per row). Not thread-safe: its owner serialises every call (Workspace's mutex, or
 // the notice thread that owns its own Store). Writes that belong together run inside
 // database().transaction().
 class Store {
@@ -34,8 +37,10 @@ class Store {
     bool excludePlaceholders = true;
   };
 
-  // Opens the database file at |path| and makes sure its schema is in place.
-  static os::Result<std::unique_ptr<Store>> open(const std::string& path);
+  // Opens the database file at |path| and makes sure its schema is in place. Plug-in rows are
+  // resolved against |sdks|, which the store shares.
+  static os::Result<std::unique_ptr<Store>> open(const std::string& path,
+                                                 std::shared_ptr<sdk::SdkCache> sdks);
 
   Database& database() { return *db_; }
 
@@ -47,7 +52,9 @@ class Store {
   os::Result<std::vector<std::shared_ptr<const ApplicationRecord>>> applications();
   os::Result<PlugInList> plugIns(const Selection& selection);
 
-  // Inserts or updates the row of |fields|.path (applications) or |fields|.uuid (plug-ins).
+  // Inserts or updates the row of |fields|.path (applications) or |fields|.uuid (plug-ins). A
+  // plug-in's stored identifier and extension point are derived from |fields| as given, so the
+  // caller passes the bundle's own plug-in dictionary, not a resolved one.
   os::Status putApplication(const ApplicationRecord::Fields& fields);
   os::Status putPlugIn(const PlugInRecord::Fields& fields);
   os::Status deletePlugIn(const value::Uuid& uuid);
@@ -62,15 +69,19 @@ class Store {
   os::Result<std::vector<Change>> changesAfter(std::int64_t sequence, int limit);
 
  private:
-  explicit Store(std::unique_ptr<Database> db) : db_(std::move(db)) {}
+  Store(std::unique_ptr<Database> db, std::shared_ptr<sdk::SdkCache> sdks)
+      : db_(std::move(db)), sdks_(std::move(sdks)) {}
 
   os::Result<std::shared_ptr<const PlugInRecord>> onePlugIn(const std::string& where,
                                                             const std::string& key);
   os::Result<PlugInList> plugInRows(Statement& statement);
-  static os::Result<std::shared_ptr<const PlugInRecord>> plugInRow(const Statement& row);
+  // The record of |row|, resolved against the SDKs of |sdkGeneration|.
+  os::Result<std::shared_ptr<const PlugInRecord>> plugInRow(const Statement& row,
+                                                            std::uint64_t sdkGeneration);
   static std::shared_ptr<const ApplicationRecord> applicationRow(const Statement& row, int first);
 
   std::unique_ptr<Database> db_;
+  const std::shared_ptr<sdk::SdkCache> sdks_;
 };
 
 }  // namespace registrum

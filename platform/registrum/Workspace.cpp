@@ -11,7 +11,6 @@
 #include "platform/registrum/ChangeWatcher.h"
 #include "platform/registrum/RecordFields.h"
 #include "platform/registrum/Store.h"
-#include "platform/sdk/SdkRegistry.h"
 
 namespace registrum {
 
@@ -48,6 +47,24 @@ std::optional<std::string> plainString(const value::Dictionary& rule, std::strin
   return text;
 }
 
+// Whether reading a bundle failed for a reason of the bundle (it is left out of its application)
+// rather than of the system (the install fails, to be tried again).
+bool isBundleFault(int errnum) {
+  switch (errnum) {
+    case ENOENT:
+    case ENOTDIR:
+    case EINVAL:
+    case EFBIG:
+    case EACCES:
+    case EPERM:
+    case ELOOP:
+    case ENAMETOOLONG:
+      return true;
+    default:
+      return false;
+  }
+}
+
 bool endsWith(std::string_view text, std::string_view suffix) {
   return text.size() > suffix.size() && text.substr(text.size() - suffix.size()) == suffix;
 }
@@ -72,13 +89,17 @@ os::Result<std::shared_ptr<Workspace>> Workspace::open(const std::string& root) 
   os::Result<std::string> canonicalRoot = os::Paths::canonical(root);
   if (!canonicalRoot.ok()) return canonicalRoot.error();
   std::string rootPath = canonicalRoot.value() == "/" ? "" : canonicalRoot.value();
-  os::Result<std::unique_ptr<Store>> store = Store::open(rootPath + "/var/db/registrum.sqlite");
+  auto sdks = std::make_shared<sdk::SdkCache>(rootPath.empty() ? "/" : rootPath);
+  os::Result<std::unique_ptr<Store>> store =
+      Store::open(rootPath + "/var/db/registrum.sqlite", sdks);
   if (!store.ok()) return store.error();
-  return std::shared_ptr<Workspace>(new Workspace(rootPath, std::move(store.value())));
+  return std::shared_ptr<Workspace>(
+      new Workspace(rootPath, std::move(sdks), std::move(store.value())));
 }
 
-Workspace::Workspace(std::string root, std::unique_ptr<Store> store)
-    : root_(std::move(root)), store_(std::move(store)) {}
+Workspace::Workspace(std::string root, std::shared_ptr<sdk::SdkCache> sdks,
+                     std::unique_ptr<Store> store)
+    : root_(std::move(root)), sdks_(std::move(sdks)), store_(std::move(store)) {}
 
 Workspace::~Workspace() = default;
 
@@ -86,7 +107,7 @@ os::Status Workspace::addObserver(const std::shared_ptr<Observer>& observer) {
   std::lock_guard lock(watcherMutex_);
   if (!watcher_) {
     os::Result<std::unique_ptr<ChangeWatcher>> started =
-        ChangeWatcher::start(databasePath(), notifyFile());
+        ChangeWatcher::start(databasePath(), notifyFile(), sdks_);
     if (!started.ok()) return started.error();
     watcher_ = std::move(started.value());
   }
@@ -102,6 +123,10 @@ os::Status Workspace::addObserver(const std::shared_ptr<Observer>& observer) {
 void Workspace::removeObserver(const Observer* observer) {
   std::lock_guard lock(watcherMutex_);
   if (watcher_) watcher_->remove(observer);
+}
+
+std::uint64_t Workspace::sdkGeneration() const {
+  return sdks_->refresh();
 }
 
 os::Result<std::shared_ptr<const PlugInRecord>> Workspace::plugInForUuid(
@@ -198,8 +223,8 @@ os::Status Workspace::unregisterPlugIn(const std::string& path) {
   });
 }
 
-os::Result<std::shared_ptr<const ApplicationRecord>> Workspace::installApplication(
-    const std::string& path, InstallOptions options) {
+os::Result<Installation> Workspace::installApplication(const std::string& path,
+                                                       InstallOptions options) {
   os::Result<std::string> directory = BundleReader::bundleDirectory(path);
   if (!directory.ok()) return directory.error();
   if (!endsWith(directory.value(), ".app")) {
@@ -208,7 +233,8 @@ os::Result<std::shared_ptr<const ApplicationRecord>> Workspace::installApplicati
   }
   os::Result<value::Dictionary> info = BundleReader::readInfo(directory.value());
   if (!info.ok()) return info.error();
-  os::Result<std::vector<PlugInBundle>> bundles = BundleReader::readPlugInsOf(directory.value());
+  std::vector<SkippedBundle> skipped;
+  os::Result<std::vector<PlugInBundle>> bundles = readPlugInsOf(directory.value(), skipped);
   if (!bundles.ok()) return bundles.error();
   auto application = std::make_shared<const ApplicationRecord>(
       RecordFields::application(directory.value(), info.value(), options.placeholder));
@@ -234,7 +260,11 @@ os::Result<std::shared_ptr<const ApplicationRecord>> Workspace::installApplicati
     return store_->appendChange(Store::ChangeKind::Install, installed);
   });
   if (!status.ok()) return status.error();
-  return application;
+  for (const SkippedBundle& bundle : skipped) {
+    os::Log::write(kLogWarning, "registry: left " + bundle.path + " out of " + application->path() +
+                                    ": " + bundle.reason);
+  }
+  return Installation{application, std::move(skipped)};
 }
 
 os::Status Workspace::finishInstallation(const std::string& path) {
@@ -335,6 +365,24 @@ os::Result<std::shared_ptr<const ApplicationRecord>> Workspace::containingApplic
   return std::make_shared<const ApplicationRecord>(std::move(fields));
 }
 
+os::Result<std::vector<PlugInBundle>> Workspace::readPlugInsOf(
+    const std::string& application, std::vector<SkippedBundle>& skipped) {
+  os::Result<std::vector<std::string>> paths = BundleReader::plugInPathsOf(application);
+  if (!paths.ok()) return paths.error();
+  std::vector<PlugInBundle> bundles;
+  for (const std::string& path : paths.value()) {
+    os::Result<PlugInBundle> bundle = BundleReader::readPlugIn(path);
+    if (bundle.ok()) {
+      bundles.push_back(std::move(bundle.value()));
+    } else if (isBundleFault(bundle.error().errnum)) {
+      skipped.push_back(SkippedBundle{path, bundle.error().message});
+    } else {
+      return bundle.error();
+    }
+  }
+  return bundles;
+}
+
 os::Result<std::shared_ptr<const PlugInRecord>> Workspace::storePlugIn(
     const PlugInBundle& bundle, std::shared_ptr<const ApplicationRecord> application,
     const std::shared_ptr<const PlugInRecord>& earlier, bool dataContainer, PendingFiles& files) {
@@ -346,8 +394,9 @@ os::Result<std::shared_ptr<const PlugInRecord>> Workspace::storePlugIn(
   fields.registrationDate = now();
   fields.onSystemPartition = bundle.path.starts_with(root_ + "/System/");
   fields.infoDictionary = bundle.info;
-  value::Dictionary resolved = sdk::SdkRegistry(root_.empty() ? "/" : root_).resolve(bundle.info);
-  fields.plugInDictionary = *resolved.find("QSExtension")->asDictionary();
+  // The bundle's own plug-in dictionary: the stored identifier and extension point follow the
+  // manifest, whatever the SDK says later. Reading the row back resolves it.
+  fields.plugInDictionary = *bundle.info.find("QSExtension")->asDictionary();
   std::string container = containerPath(fields.uuid);
   if (dataContainer) {
     if (!std::filesystem::exists(container)) files.created.push_back(container);
@@ -360,7 +409,12 @@ os::Result<std::shared_ptr<const PlugInRecord>> Workspace::storePlugIn(
   RecordFields::derive(fields);
   os::Status put = store_->putPlugIn(fields);
   if (!put.ok()) return put.error();
-  return std::make_shared<const PlugInRecord>(std::move(fields));
+  os::Result<std::shared_ptr<const PlugInRecord>> stored = store_->plugInByUuid(fields.uuid);
+  if (stored.ok() && !stored.value()) {
+    return os::Error{EIO,
+                     "registry database: the row just written for " + bundle.path + " is gone"};
+  }
+  return stored;
 }
 
 }  // namespace registrum

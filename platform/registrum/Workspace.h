@@ -1,14 +1,17 @@
 #pragma once
 
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <mutex>
 #include <string>
+#include <vector>
 
 #include "platform/os/Error.h"
 #include "platform/registrum/ApplicationRecord.h"
 #include "platform/registrum/Observer.h"
 #include "platform/registrum/PlugInRecord.h"
+#include "platform/sdk/SdkCache.h"
 #include "platform/value/Value.h"
 
 namespace registrum {
@@ -24,6 +27,18 @@ struct InstallOptions {
   bool dataContainer = true;  // for every plug-in of the application
 };
 
+// A bundle of an application's "PlugIns/" that installApplication left out, and why.
+struct SkippedBundle {
+  std::string path;
+  std::string reason;
+};
+
+// What installApplication installed.
+struct Installation {
+  std::shared_ptr<const ApplicationRecord> application;
+  std::vector<SkippedBundle> skipped;  // in name order; empty when every bundle is installed
+};
+
 class ChangeWatcher;
 class Store;
 struct PlugInBundle;
@@ -34,8 +49,13 @@ struct PlugInBundle;
 // change is appended to a change log, from which each Workspace with observers delivers install
 // and uninstall notices, whichever process made the change.
 //
+// A plug-in row keeps the bundle's own Info.plist; its plug-in dictionary is resolved against the
+// SDKs of the root each time it is read (sdk::SdkCache, which reads an SDK file once and keeps
+// it until the SDK directory changes), so an SDK added, changed or removed counts from the next
+// read, in every process, without registering anything again.
+//
 // Safe for concurrent use from any thread without external synchronisation. Records returned
-// are snapshots; they do not change when the registry does.
+// are snapshots; they do not change when the registry or an SDK does.
 //
 // Errors are os::Error values: EINVAL for a bundle that is not a valid plug-in or application
 // (malformed Info.plist, missing or mistyped "QSExtension"), ENOTDIR for a path that is no
@@ -79,6 +99,12 @@ class Workspace {
 
   // --- Lookups (null pointer: not found) ---
 
+  // A number that grows whenever an SDK of this root is added, changed or removed; 0 until the
+  // first change. Takes the changes queued so far first (one system call), so a change whose
+  // write returned before this call counts. A caller that keeps something built from records
+  // drops it when the number has grown since it last looked.
+  std::uint64_t sdkGeneration() const;
+
   // The plug-in with |uuid|, a placeholder's included.
   os::Result<std::shared_ptr<const PlugInRecord>> plugInForUuid(const value::Uuid& uuid) const;
   // The plug-in registered for the bundle at |path| (resolved like registration resolves it),
@@ -110,7 +136,7 @@ class Workspace {
   // Registers the plug-in bundle at |path|: reads its Info.plist (any property-list encoding;
   // it needs a dictionary "QSExtension") and its Entitlements.plist when present, registers the
   // nearest enclosing ".app" directory as a complete application when it is not yet known, and
-  // stores the record with its plug-in dictionary resolved against its SDK. A path already
+  // stores the record. A path already
   // registered keeps its UUID and data container and has every other field refreshed. Returns
   // the new record; observers get an install notice, preceded for a path already registered by
   // an uninstall notice with the record as it was.
@@ -121,11 +147,16 @@ class Workspace {
   os::Status unregisterPlugIn(const std::string& path);
 
   // Installs the application at |path| (a directory named "*.app" with an Info.plist
-  // dictionary) with every bundle directory in its "PlugIns/", all or nothing. EEXIST when
-  // the application is already registered. Observers get an install notice for its plug-ins
-  // (none when it has no plug-ins).
-  os::Result<std::shared_ptr<const ApplicationRecord>> installApplication(
-      const std::string& path, InstallOptions options = {});
+  // dictionary) with the plug-in bundles among the directories of its "PlugIns/". A bundle that
+  // is no usable plug-in is left out: its Info.plist missing, malformed, too large, unreadable or
+  // without a "QSExtension" dictionary, its Entitlements.plist unreadable or malformed. It is
+  // named in the result's skipped list with the reason, and logged once the install committed.
+  // Anything else installs nothing: an application that cannot be read (its Info.plist, the
+  // listing of "PlugIns/"), a bundle that cannot be read for a reason of the system rather than
+  // of the bundle (EIO, ENOMEM, EMFILE, ...), a database error; EEXIST when the application is
+  // already registered. Observers get an install notice for its plug-ins (none when it has no
+  // plug-ins).
+  os::Result<Installation> installApplication(const std::string& path, InstallOptions options = {});
   // Marks the placeholder application at |path| complete; ENOENT when unknown, EINVAL when
   // it is not a placeholder. Observers get an install notice for its plug-ins.
   os::Status finishInstallation(const std::string& path);
@@ -140,7 +171,7 @@ class Workspace {
  private:
   struct PendingFiles;
 
-  Workspace(std::string root, std::unique_ptr<Store> store);
+  Workspace(std::string root, std::shared_ptr<sdk::SdkCache> sdks, std::unique_ptr<Store> store);
 
   std::string databasePath() const;
   std::string notifyFile() const;
@@ -155,6 +186,9 @@ class Workspace {
   // The application of |bundle| (registered now when unknown); null outside any application.
   os::Result<std::shared_ptr<const ApplicationRecord>> containingApplication(
       const PlugInBundle& bundle);
+  // The plug-in bundles of the application directory |application|, with those left out.
+  static os::Result<std::vector<PlugInBundle>> readPlugInsOf(const std::string& application,
+                                                             std::vector<SkippedBundle>& skipped);
   // Writes the plug-in row of |bundle|, keeping the UUID and data container of |earlier|, the
   // row registered at its path before (null when none was).
   os::Result<std::shared_ptr<const PlugInRecord>> storePlugIn(
@@ -162,6 +196,7 @@ class Workspace {
       const std::shared_ptr<const PlugInRecord>& earlier, bool dataContainer, PendingFiles& files);
 
   const std::string root_;
+  const std::shared_ptr<sdk::SdkCache> sdks_;
   const std::unique_ptr<Store> store_;
   mutable std::mutex storeMutex_;
   std::mutex watcherMutex_;

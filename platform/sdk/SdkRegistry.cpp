@@ -11,7 +11,6 @@ namespace sdk {
 namespace {
 
 constexpr int kLogWarning = 4;
-constexpr int kLogNotice = 5;
 
 }  // namespace
 
@@ -28,12 +27,16 @@ std::string SdkRegistry::rootDirectory() const {
   return root;
 }
 
+std::string SdkRegistry::directory() const {
+  return rootDirectory() + "/System/Library/SDKs";
+}
+
 std::optional<std::string> SdkRegistry::pathForIdentifier(std::string_view identifier) const {
   if (identifier.empty() || identifier.front() == '.' ||
       identifier.find_first_of(std::string_view("/\0", 2)) != std::string_view::npos) {
     return std::nullopt;
   }
-  return rootDirectory() + "/System/Library/SDKs/" + std::string(identifier) + ".plist";
+  return directory() + "/" + std::string(identifier) + ".plist";
 }
 
 std::optional<value::Dictionary> SdkRegistry::lookup(std::string_view identifier) const {
@@ -52,28 +55,6 @@ std::optional<value::Dictionary> SdkRegistry::lookup(std::string_view identifier
     return std::nullopt;
   }
   return *dictionary;
-}
-
-value::Dictionary SdkRegistry::resolve(const value::Dictionary& info) const {
-  const value::Value* plugIn = info.find("QSExtension");
-  const value::Dictionary* plugInDictionary = plugIn ? plugIn->asDictionary() : nullptr;
-  if (!plugInDictionary) {
-    os::Log::write(kLogNotice, "SDK registry: no \"QSExtension\" dictionary to resolve");
-    return info;
-  }
-  const value::Value* point = plugInDictionary->find("QSExtensionPointIdentifier");
-  if (!point) return canonicalize(info);
-  const std::string* name = point->asString();
-  if (!name) {
-    os::Log::write(kLogNotice, "invalid SDK key:" + point->description());
-    return info;
-  }
-  std::optional<value::Dictionary> sdk = lookup(*name);
-  if (!sdk) {
-    os::Log::write(kLogNotice, "plug-in sdk \"" + *name + "\" not registered");
-    return canonicalize(info);
-  }
-  return canonicalize(mergeDictionary(*sdk, info));
 }
 
 }  // namespace sdk

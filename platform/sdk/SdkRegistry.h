@@ -12,8 +12,8 @@ namespace sdk {
 // The SDK dictionaries of a device root, one per extension point:
 // "<root>/System/Library/SDKs/<extension point identifier>.plist", a property list in any
 // encoding holding a dictionary shaped like a bundle's Info.plist. Files are read at every
-// lookup, so an SDK installed while a process runs is seen at once. Immutable; safe to use from
-// any thread.
+// lookup, so an SDK installed while a process runs is seen at once (SdkCache keeps them until
+// they change). Immutable; safe to use from any thread.
 class SdkRegistry {
  public:
   // The registry of the current device root, read from os::Paths::root() at every lookup.
@@ -21,6 +21,9 @@ class SdkRegistry {
 
   // The registry of the device root |root| (a directory path).
   explicit SdkRegistry(std::string root);
+
+  // "<root>/System/Library/SDKs", whether or not it exists.
+  std::string directory() const;
 
   // The file of |identifier|'s SDK dictionary, whether or not it exists; nothing for an
   // identifier that can name no file: empty, containing '/' or a NUL byte, or starting with '.'.
@@ -30,14 +33,6 @@ class SdkRegistry {
   // or the identifier is refused (see pathForIdentifier); a file that exists but cannot be read
   // or holds no dictionary is also nothing, with a log line naming the file and the reason.
   std::optional<value::Dictionary> lookup(std::string_view identifier) const;
-
-  // |info| (a bundle's Info.plist) with the SDK dictionary of its extension point
-  // ("QSExtension"."QSExtensionPointIdentifier") merged under it by mergeDictionary, then
-  // canonicalized (see SdkMerge.h). Without an extension point, or when no SDK is registered for
-  // it, |info| is only canonicalized. A non-string extension point leaves |info| unchanged and
-  // is logged ("invalid SDK key:<value>"); so does a "QSExtension" that is no dictionary. Never
-  // fails.
-  value::Dictionary resolve(const value::Dictionary& info) const;
 
  private:
   SdkRegistry() = default;

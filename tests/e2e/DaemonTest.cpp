@@ -30,6 +30,13 @@ bool DaemonTest::start(const std::vector<std::string>& arguments, const std::str
   return true;
 }
 
+bool DaemonTest::restart() {
+  client_.reset();
+  os::Status restarted = daemon_->restart(AXD_EXECUTABLE);
+  if (!restarted.ok()) ADD_FAILURE() << "axd did not restart: " << restarted.error().message;
+  return restarted.ok();
+}
+
 BlockingClient& DaemonTest::client() {
   if (!client_) {
     client_ =

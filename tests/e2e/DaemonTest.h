@@ -27,6 +27,9 @@ class DaemonTest : public ::testing::Test {
   // first. False, with the reason recorded as a test failure, when the daemon does not come up.
   bool start(const std::vector<std::string>& arguments = {}, const std::string& serviceName = "",
              const std::map<std::string, std::string>& environment = {});
+  // Stops the daemon and starts it again on the same root; false, with the reason recorded as a
+  // test failure, when it does not come up.
+  bool restart();
   DaemonProcess& daemon() { return *daemon_; }
   // The daemon's device root with its symbolic links resolved, as the registry names paths.
   const std::string& root() const { return root_; }

@@ -31,24 +31,4 @@ TEST_F(SdkRegistryTest, MissingBrokenAndRefusedAreNothing) {
   }
 }
 
-Dictionary infoFor(Value point) {
-  return {{"QFBundleShortVersionString", Value::string("2.0")},
-          {"QSExtension", Value::dictionary({{"QSExtensionPointIdentifier", point},
-                                             {"CleanTimeout", Value::integer(7)}})}};
-}
-
-// Without an SDK the manifest is only canonicalized, which WorkspaceTest sees in every record.
-TEST_F(SdkRegistryTest, ResolveMergesTheSdkThenFillsDefaults) {
-  root_.writePlist("System/Library/SDKs/com.example.point.plist", Value::dictionary(kSdk));
-  Dictionary resolved = registry_.resolve(infoFor(Value::string("com.example.point")));
-  const Dictionary& plugIn = *resolved.find("QSExtension")->asDictionary();
-  EXPECT_EQ(*plugIn.find("QSExtensionProtocol"), Value::string("Proto"));
-  EXPECT_EQ(*plugIn.find("CleanTimeout"), Value::integer(5));
-  EXPECT_EQ(*plugIn.find("QSExtensionAttributes"),
-            Value::dictionary({{"QSExtensionVersion", Value::string("2.0")}}));
-  // A non-string extension point leaves the manifest as it is.
-  Dictionary info = infoFor(Value::integer(3));
-  EXPECT_EQ(registry_.resolve(info), info);
-}
-
 }  // namespace

@@ -195,11 +195,16 @@ TEST_F(WorkspaceTest, FailedInstallsLeaveTheRegistryUnchanged) {
   std::string before = snapshot();
 
   EXPECT_EQ(workspace_->installApplication(app).error().errnum, EEXIST);
-  EXPECT_NE(workspace_->installApplication(root_ / "B.app").error().message.find("Zbad.appex"),
-            std::string::npos);
   EXPECT_EQ(workspace_->installApplication(root_ / "NoInfo.app").error().errnum, ENOENT);
   EXPECT_EQ(workspace_->installApplication(root_ / "NotAnApp").error().errnum, EINVAL);
   EXPECT_EQ(snapshot(), before);
+
+  // A broken bundle is left out, not the application.
+  auto installed = workspace_->installApplication(root_ / "B.app");
+  ASSERT_TRUE(installed.ok()) << installed.error().message;
+  ASSERT_EQ(installed.value().skipped.size(), 1u);
+  EXPECT_EQ(installed.value().skipped[0].path, root_ / "B.app/PlugIns/Zbad.appex");
+  EXPECT_EQ(workspace_->plugInsWithinApplication(root_ / "B.app").value().size(), 1u);
 }
 
 TEST_F(WorkspaceTest, AFailureInsideTheTransactionRollsBackEarlierWrites) {
@@ -277,7 +282,7 @@ TEST_F(WorkspaceTest, QueryPreselectsPlainStringsAndHonoursTheFilter) {
   EXPECT_EQ(seen, (std::vector<std::string>{"a+", "d", "b", "c"}));
 }
 
-TEST_F(WorkspaceTest, ReopeningKeepsRecordsAndAnUnknownSchemaOrAFileIsRefused) {
+TEST_F(WorkspaceTest, ReopeningKeepsRecordsMigratesAnOldSchemaAndRefusesAnUnknownOneOrAFile) {
   auto record = registerAt(root_.plugIn("P.appex", "p"));
   workspace_->clearCaches();
   auto reopened = Workspace::open(root_.root());
@@ -285,12 +290,27 @@ TEST_F(WorkspaceTest, ReopeningKeepsRecordsAndAnUnknownSchemaOrAFileIsRefused) {
   EXPECT_EQ(reopened.value()->plugInForUuid(record->uuid()).value()->bundlePath(),
             record->bundlePath());
 
-  sqlite3* db = nullptr;
-  ASSERT_EQ(sqlite3_open((root_ / "var/db/registrum.sqlite").c_str(), &db), SQLITE_OK);
-  sqlite3_busy_timeout(db, 10000);
-  ASSERT_EQ(sqlite3_exec(db, "UPDATE schema_version SET version = 99", nullptr, nullptr, nullptr),
-            SQLITE_OK);
-  sqlite3_close(db);
+  auto execute = [&](const char* sql) {
+    sqlite3* db = nullptr;
+    ASSERT_EQ(sqlite3_open((root_ / "var/db/registrum.sqlite").c_str(), &db), SQLITE_OK);
+    sqlite3_busy_timeout(db, 10000);
+    EXPECT_EQ(sqlite3_exec(db, sql, nullptr, nullptr, nullptr), SQLITE_OK) << sql;
+    sqlite3_close(db);
+  };
+  // A version 1 database, which kept the plug-in dictionary resolved at registration, is
+  // migrated, and its records follow the SDKs of today.
+  execute(
+      "ALTER TABLE plugins ADD COLUMN plugin_dictionary BLOB NOT NULL DEFAULT x'A0'; "
+      "UPDATE schema_version SET version = 1");
+  root_.writePlist(
+      "System/Library/SDKs/com.example.point.plist",
+      Value::dictionary({{"QSExtension", Value::dictionary({{"Sdk", Value::integer(1)}})}}));
+  auto migrated = Workspace::open(root_.root());
+  ASSERT_TRUE(migrated.ok()) << migrated.error().message;
+  auto read = migrated.value()->plugInForUuid(record->uuid()).value();
+  EXPECT_EQ(read->valueForKey("Sdk", PlugInRecord::Scope::PlugInDictionary), Value::integer(1));
+
+  execute("UPDATE schema_version SET version = 99");
   auto refused = Workspace::open(root_.root());
   ASSERT_FALSE(refused.ok());
   EXPECT_EQ(refused.error().errnum, EIO);

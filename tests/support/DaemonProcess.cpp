@@ -63,6 +63,14 @@ os::Result<std::unique_ptr<DaemonProcess>> DaemonProcess::start(const std::strin
   return daemon;
 }
 
+os::Status DaemonProcess::restart(const std::string& executable,
+                                  std::chrono::milliseconds timeout) {
+  stop();
+  os::Status started = spawn(executable);
+  if (!started.ok()) return started;
+  return waitUntilListening(timeout);
+}
+
 DaemonProcess::DaemonProcess(std::string root, Options options)
     : root_(std::move(root)), options_(std::move(options)), previousRoot_(environmentRoot()) {
   setenv("ANNEXA_ROOT", root_.c_str(), 1);

@@ -40,6 +40,11 @@ class DaemonProcess {
   DaemonProcess(const DaemonProcess&) = delete;
   DaemonProcess& operator=(const DaemonProcess&) = delete;
 
+  // Stops the daemon and starts |executable| again on the same root with the same options, as
+  // start() does; the root and what it holds stay.
+  os::Status restart(const std::string& executable,
+                     std::chrono::milliseconds timeout = std::chrono::seconds(10));
+
   pid_t pid() const { return pid_; }
   const std::string& root() const { return root_; }
   // True while the daemon runs (it has not exited or been killed).

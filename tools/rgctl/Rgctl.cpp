@@ -14,6 +14,9 @@ int Rgctl::install(const std::string& path, registrum::InstallOptions options) {
   if (!open()) return 1;
   auto installed = workspace_->installApplication(path, options);
   if (!installed.ok()) return fail(installed.error());
+  for (const registrum::SkippedBundle& skipped : installed.value().skipped) {
+    std::cerr << "rgctl: left out " << skipped.path << ": " << skipped.reason << "\n";
+  }
   return done(os::success());
 }
 

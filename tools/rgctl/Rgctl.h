@@ -8,7 +8,8 @@
 
 // The command-line front of the application registry: each command runs one registry operation
 // on the workspace of the device root, prints its outcome and returns the exit status, 0 on
-// success and 1 on failure (the message goes to standard error as "rgctl: MESSAGE").
+// success and 1 on failure (the message goes to standard error as "rgctl: MESSAGE"). An install
+// that left bundles out succeeds and says so on standard error, one line per bundle.
 class Rgctl {
  public:
   struct Options {
