@@ -1,5 +1,6 @@
 // axd: the Annexa plug-in daemon.
 
+#include <signal.h>
 #include <unistd.h>
 
 #include <cstdint>
@@ -48,6 +49,8 @@ int main(int argc, char** argv) {
   }
   if (optind < argc) usage();
 
+  // A file-size limit must fail a save with EFBIG, which keeps the old file, not end the daemon.
+  signal(SIGXFSZ, SIG_IGN);
   auto server = AXDServer::initForService(serviceName.c_str(), databasePath);
   if (!server) {
     os::Log::write(3, "unable to construct server");

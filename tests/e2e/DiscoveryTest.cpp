@@ -14,6 +14,7 @@
 namespace {
 
 using bundles::PlugInContents;
+using value::Dictionary;
 using value::Value;
 
 const std::string kManager = AXD_VENDOR_PREFIX ".private.annexa.manager";
@@ -67,7 +68,11 @@ TEST_F(DiscoveryTest, TheFlagsDecideWhichVersionsAndCopiesOfOneIdentifierComeBac
 TEST_F(DiscoveryTest, VisibilityFollowsTheClientsApplicationEntitlementsAndFlags) {
   std::string hostAxctl = bundles::hostApplication(root() + "/Host.app", AXCTL_EXECUTABLE);
   std::string otherAxctl = bundles::hostApplication(root() + "/Other.app", AXCTL_EXECUTABLE);
-  add({inApp("Host", {.id = "vis.dedicated", .extension = {{"Dedicated", Value::boolean(true)}}}),
+  const Dictionary dedicated{{"Dedicated", Value::boolean(true)}};
+  // Beside the host's plug-ins folder, in one whose name starts like it: not the host's own.
+  std::string beside = bundles::writePlugIn(root() + "/Host.app/PlugInsOld/vis.beside.appex",
+                                            {.id = "vis.beside", .extension = dedicated});
+  add({inApp("Host", {.id = "vis.dedicated", .extension = dedicated}), beside,
        inApp("Other", {.id = "vis.app"}),
        bundles::writePlugIn(root() + "/System/Library/PlugIns/vis.system.appex",
                             {.id = "vis.system"}),
@@ -79,6 +84,7 @@ TEST_F(DiscoveryTest, VisibilityFollowsTheClientsApplicationEntitlementsAndFlags
   Subprocess::Outcome fromHost = Subprocess::run(hostAxctl, {"match"});
   ASSERT_EQ(fromHost.status, 0) << fromHost.err;
   EXPECT_TRUE(lists(fromHost.out, "vis.dedicated")) << fromHost.out;
+  EXPECT_FALSE(lists(fromHost.out, "vis.beside")) << fromHost.out;
   Subprocess::Outcome fromOther = Subprocess::run(otherAxctl, {"match"});
   ASSERT_EQ(fromOther.status, 0) << fromOther.err;
   EXPECT_FALSE(lists(fromOther.out, "vis.dedicated")) << fromOther.out;
@@ -91,7 +97,7 @@ TEST_F(DiscoveryTest, VisibilityFollowsTheClientsApplicationEntitlementsAndFlags
   EXPECT_EQ(matchOutcome(std::nullopt, kAll), kUnauthorized);
   grant({{kManager, Value::boolean(true)}});
   EXPECT_EQ(matchIds(std::nullopt, kAll | AXProtocol::kDiscoverSystemOnly),
-            (Ids{"vis.app", "vis.dedicated", "vis.guarded", "vis.system"}));
+            (Ids{"vis.app", "vis.beside", "vis.dedicated", "vis.guarded", "vis.system"}));
 }
 
 TEST_F(DiscoveryTest, DiscoveringEverythingIsRefusedToASandboxedManager) {

@@ -40,7 +40,9 @@ class AXDPlugInMatchingTest : public DeviceRootTest {
     fields.uuid = *value::Uuid::parse(kUuidText);
     if (contained) fields.containingApplication = application(app_);
     fields.plugInDictionary =
-        fields.plugInDictionary.with("QSExtensionAttributes", Value::dictionary(attributes));
+        fields.plugInDictionary.with("QSExtensionAttributes", Value::dictionary(attributes))
+            .with("Dedicated", kFalse)
+            .with("Shadow", S("plug-in"));
     fields.infoDictionary =
         fields.infoDictionary.with("InfoOnly", S("raw")).with("Shadow", S("info"));
     fields.entitlements = Dictionary{{"e.string", S("yes")}, {"e.false", kFalse}};
@@ -84,7 +86,12 @@ TEST_F(AXDPlugInMatchingTest, KeysNameTheirValues) {
       {"Kinds", A({S("gamma"), S("alpha")}), true},
       {"Kinds", S("7"), false},
       {"InfoOnly", S("raw"), true},
-      {"Shadow", S("info"), false},  // the attribute hides the Info.plist key
+      {"QSExtensionProtocol", S("ToolProtocol"), true},  // the plug-in dictionary's
+      {"Dedicated", kFalse, true},
+      {"Dedicated", kTrue, false},
+      {"Shadow", S("attribute"), true},  // the attribute hides the plug-in dictionary's
+      {"Shadow", S("plug-in"), false},
+      {"Shadow", S("info"), false},
       {"ENTITLEMENT:e.string", S("yes"), true},
       {"ENTITLEMENT:e.false", kFalse, true},
       {"ENTITLEMENT:Count", kTrue, false},
@@ -120,14 +127,27 @@ TEST_F(AXDPlugInMatchingTest, NoContainingApplicationNeverMatchesThatKey) {
 
 TEST_F(AXDPlugInMatchingTest, OperatorsAreTriedLongestFirst) {
   auto plugIn = record({});
+  // Each operator with a value below, at and above its bound; "9" is above "10" as plain text.
+  const struct {
+    const char* op;
+    bool below, at, above;
+  } bounds[] = {
+      {"<>", true, false, true}, {"<=", true, true, false}, {">=", false, true, true},
+      {"=", false, true, false}, {"<", true, false, false}, {">", false, false, true},
+      {"", false, true, false},
+  };
+  for (const auto& b : bounds) {
+    std::string pattern = std::string(b.op) + "10";
+    EXPECT_EQ(plugIn->matchValuePattern("9", pattern), b.below) << pattern;
+    EXPECT_EQ(plugIn->matchValuePattern("10", pattern), b.at) << pattern;
+    EXPECT_EQ(plugIn->matchValuePattern("11", pattern), b.above) << pattern;
+  }
   const struct {
     const char* value;
     const char* pattern;
     bool expected;
   } cases[] = {
       {"2.10", ">2.9", true},
-      {"2.10", "=2.10", true},
-      {"2.10", "2.9", false},
       // These three would flip were the operators tried in another order.
       {"3", "<=2", false},
       {"3", ">=3", true},
