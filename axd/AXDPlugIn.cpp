@@ -82,6 +82,11 @@ std::shared_ptr<AXDPlugIn> AXDPlugIn::initWithRGData(
                     {url.path(), error->description()});
     return nullptr;
   }
+  std::optional<value::Value> demand = record->pluginKey("QSExtensionHostEntitlement");
+  if (demand && (!demand->asString() || demand->asString()->empty())) {
+    os::Log::notice("plug-in at %@ demands a malformed host entitlement %@: no host may use it",
+                    {url.path(), demand->description()});
+  }
   return record;
 }
 

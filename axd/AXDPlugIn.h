@@ -121,7 +121,9 @@ class AXDPlugIn : public AXPlugInCore {
   // entitlement") that the plug-in matches ("the host's plug-in entitlement does not allow this
   // plug-in"); the client must have the entitlement that the plug-in's
   // "QSExtensionHostEntitlement" names, when it names one ("the host does not have the
-  // \"<name>\" entitlement"). A "QSExtensionHostEntitlement" that is no string names nothing.
+  // \"<name>\" entitlement"). A "QSExtensionHostEntitlement" that is present but no string, or
+  // empty, refuses every host ("the plug-in's host entitlement demand is malformed"; the record
+  // logged it when it was built).
   std::optional<std::string> allowForClient(const AXDZynClient& client) const;
   // The consent services granted to the plug-in's containing application, read afresh from the
   // consent store. Empty for a plug-in outside any application, and, after a log line, when the

@@ -16,8 +16,11 @@ std::optional<std::string> AXDPlugIn::allowForClient(const AXDZynClient& client)
     if (!match(*rule)) return "the host's plug-in entitlement does not allow this plug-in";
   }
   std::optional<value::Value> demanded = pluginKey("QSExtensionHostEntitlement");
-  const std::string* name = demanded ? demanded->asString() : nullptr;
-  if (name && !client.hasEntitlement(*name)) {
+  if (!demanded) return std::nullopt;
+  // A demand that names no entitlement cannot be met: it must not read as no demand at all.
+  const std::string* name = demanded->asString();
+  if (!name || name->empty()) return "the plug-in's host entitlement demand is malformed";
+  if (!client.hasEntitlement(*name)) {
     return os::format("the host does not have the \"%@\" entitlement", {*name});
   }
   return std::nullopt;

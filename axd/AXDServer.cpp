@@ -80,9 +80,17 @@ bool AXDServer::holdOnPlugIn(const AXDPlugIn& plugIn) {
   });
 }
 
-void AXDServer::addHold(std::shared_ptr<AXDPlugInHold> hold) {
-  syncQueue_->sync([&] { holds_.push_back(std::move(hold)); });
-  postAnnotationChange();
+bool AXDServer::addHold(std::shared_ptr<AXDPlugInHold> hold) {
+  // The client's death stops its work before its holds are released under this same queue, so
+  // a hold added here is either released by that release or refused now.
+  bool added = syncQueue_->sync([&] {
+    std::shared_ptr<AXDZynClient> client = hold->client();
+    if (client && !client->acceptWork()) return false;
+    holds_.push_back(std::move(hold));
+    return true;
+  });
+  if (added) postAnnotationChange();
+  return added;
 }
 
 void AXDServer::unholdToken(const value::Uuid& token) {

@@ -52,10 +52,12 @@ class AXDServer : public AXDatabase, public AXDatabaseDelegate {
 
   // ---- Holds ----------------------------------------------------------------------------------
 
-  // True when an active hold covers a record with |plugIn|'s UUID.
+  // True when an active hold covers |plugIn| (AXDPlugInHold::blocks).
   bool holdOnPlugIn(const AXDPlugIn& plugIn);
-  // Appends |hold| to the active holds (no check for overlaps), then posts the notification.
-  void addHold(std::shared_ptr<AXDPlugInHold> hold);
+  // Appends |hold| to the active holds (no check for overlaps), then posts the notification;
+  // true. False, and nothing added, when the client that placed it has stopped accepting work:
+  // its connection died while the request was worked, and no one could release the hold.
+  bool addHold(std::shared_ptr<AXDPlugInHold> hold);
   // Releases the hold with token |token| (logged, notification posted); nothing when none has it.
   void unholdToken(const value::Uuid& token);
   // Releases every hold placed by |client|, in list order, each logged and notified.

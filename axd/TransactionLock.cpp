@@ -50,7 +50,10 @@ void Transaction::lockDownPlugIns() {
     return;
   }
   auto hold = std::make_shared<AXDPlugInHold>(*held, std::move(paths), client_);
-  server()->addHold(hold);
+  if (!server()->addHold(hold)) {
+    server()->debug("hold for dead client %d dropped", {client_->pid()});
+    return;
+  }
   reply_.set(AXProtocol::kUuids, value::Value::uuid(hold->uuid()));
   server()->debug("hold request granted uuid:%@", {hold->uuid().string()});
   done();

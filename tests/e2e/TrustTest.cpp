@@ -1,0 +1,87 @@
+// What an ordinary client cannot do to the daemon or to other clients, tried as an attacker and
+// as bad luck would: through the real daemon, with clients that misbehave or die at the worst
+// moment.
+
+#include <chrono>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "Annexa/AXProtocol.h"
+#include "platform/registrum/Workspace.h"
+#include "tests/e2e/Bundles.h"
+#include "tests/e2e/DaemonTest.h"
+
+namespace {
+
+using bundles::PlugInContents;
+using value::Dictionary;
+using value::Value;
+using Ids = std::vector<std::string>;
+
+class TrustTest : public DaemonTest {
+ protected:
+  std::string inApp(const std::string& app, const PlugInContents& contents) {
+    return bundles::plugIn(root() + "/Applications", app, contents);
+  }
+};
+
+TEST_F(TrustTest, AHostEntitlementDemandThatNamesNothingRefusesEveryHost) {
+  ASSERT_TRUE(start());
+  auto demanding = [&](const char* id, Value demand) {
+    return inApp("Demands", {.id = id,
+                             .extension = {{"QSExtensionHostEntitlement", demand}},
+                             .executable = "/bin/sleep"});
+  };
+  std::vector<std::string> paths = {
+      demanding("demand.number", Value::integer(1)),
+      demanding("demand.array", Value::array({Value::string("x")})),
+      demanding("demand.dictionary", Value::dictionary({{"x", Value::boolean(true)}})),
+      demanding("demand.empty", Value::string("")),
+      demanding("demand.named", Value::string("x")),
+  };
+  ASSERT_EQ(send(AXProtocol::kAdd, paths), "ok");
+  // A host with every entitlement it could name still gets only the well-formed demand.
+  grant({{"x", Value::boolean(true)}, {"1", Value::boolean(true)}});
+  EXPECT_EQ(matchIds(), Ids{"demand.named"});
+  EXPECT_EQ(send(AXProtocol::kReady, {uuid(paths[0])}),
+            "11: access to plugin demand.number denied: the plug-in's host entitlement demand is "
+            "malformed");
+  EXPECT_EQ(send(AXProtocol::kReady, {uuid(paths[4])}), "ok");
+  EXPECT_EQ(logCount("demands a malformed host entitlement"), 4u);
+}
+
+// A client that dies while its own lock request is worked: the hold it would have placed has no
+// one left to release it, so it must not be placed.
+TEST_F(TrustTest, AHoldNeverOutlivesTheClientThatAskedForIt) {
+  ASSERT_TRUE(start({"-v"}));
+  const std::string app = root() + "/Applications/Many.app";
+  std::vector<std::string> ids;
+  for (int i = 0; i < 200; ++i) {
+    ids.push_back("many." + std::to_string(1000 + i));
+    inApp("Many", {.id = ids.back()});
+  }
+  auto registry = registrum::Workspace::open(root());
+  ASSERT_TRUE(registry.ok());
+  ASSERT_TRUE(registry.value()->installApplication(app).ok());
+  ASSERT_EQ(matchIds().size(), ids.size());
+
+  for (int attempt = 0; attempt < 3; ++attempt) {
+    std::unique_ptr<RawClient> dying = connectRaw();
+    ASSERT_TRUE(dying);
+    Dictionary lock{{AXProtocol::kRequest, Value::string(AXProtocol::kLock)},
+                    {AXProtocol::kVersion, Value::unsignedInteger(AXProtocol::kCurrentVersion)},
+                    {AXProtocol::kFlags, Value::unsignedInteger(AXProtocol::kHoldApplications)},
+                    {AXProtocol::kPaths, Value::array({Value::string(app)})}};
+    std::size_t seen = logCount("request lock");
+    ASSERT_TRUE(dying->sendFrame(zyn::FrameKind::Request, 1, Value::dictionary(lock)));
+    dying.reset();
+    // Once the daemon works the lock, a later request waits for it on the service queue.
+    for (int wait = 0; wait < 1000 && logCount("request lock") == seen; ++wait) {
+      std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+    EXPECT_EQ(matchIds().size(), ids.size()) << "attempt " << attempt;
+  }
+}
+
+}  // namespace
