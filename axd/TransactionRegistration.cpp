@@ -1,6 +1,8 @@
 // The registration family of request handlers (add, remove, bulk) and the list walkers that
 // several families share.
 
+#include <algorithm>
+
 #include "Annexa/AXProtocol.h"
 #include "axd/AXDNames.h"
 #include "axd/AXDServer.h"
@@ -20,6 +22,13 @@ bool Transaction::visitPath(const value::Value& element, const PathVisitor& visi
   const std::string* path = element.asString();
   if (!path) {
     fail(AXProtocol::kMalformedRequest, "invalid request format");
+    return false;
+  }
+  if (path->find('\0') != std::string::npos) {
+    // The file system would read the path only up to the NUL: another path than the one sent.
+    std::string shown = *path;
+    std::replace(shown.begin(), shown.end(), '\0', '?');
+    fail(AXProtocol::kBadPath, os::format("invalid path (NUL byte): %@", {shown}));
     return false;
   }
   if (path->empty() || (*path)[0] != '/') {

@@ -103,8 +103,9 @@ os::Result<EntitlementTable> EntitlementTable::load() {
 }
 
 std::optional<EntitlementTable::Entry> EntitlementTable::readFile(const std::string& path) {
-  // Non-blocking, so that a FIFO in the directory cannot stall the daemon.
-  int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);
+  // Non-blocking, so that a FIFO in the directory cannot stall the daemon; never through a
+  // symbolic link, which would let whoever may write its target grant entitlements.
+  int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOFOLLOW);
   if (fd < 0) {
     skip(path, std::strerror(errno));
     return std::nullopt;

@@ -3,6 +3,7 @@
 // moment.
 
 #include <chrono>
+#include <filesystem>
 #include <string>
 #include <thread>
 #include <vector>
@@ -82,6 +83,28 @@ TEST_F(TrustTest, AHoldNeverOutlivesTheClientThatAskedForIt) {
     }
     EXPECT_EQ(matchIds().size(), ids.size()) << "attempt " << attempt;
   }
+}
+
+// Paths are taken as the file system reads them, and only the entitlement table's own files
+// grant anything.
+TEST_F(TrustTest, APathWithANulByteOrALinkedEntitlementFileIsRefused) {
+  ASSERT_TRUE(start());
+  std::string plugIn = inApp("Paths", {.id = "paths.one"});
+  EXPECT_EQ(send(AXProtocol::kAdd, {plugIn + std::string(1, '\0') + "junk"}),
+            "9: invalid path (NUL byte): " + plugIn + "?junk");
+  EXPECT_EQ(matchIds(), Ids{});
+
+  // A table file that is a symbolic link to a file elsewhere grants nothing.
+  const std::string manager = AXD_VENDOR_PREFIX ".private.annexa.manager";
+  grant({{manager, Value::boolean(true)}});
+  std::string table = root() + "/etc/annexa/entitlements.d/e2e_tests.plist";
+  std::string elsewhere = root() + "/grant.plist";
+  std::filesystem::rename(table, elsewhere);
+  std::filesystem::create_symlink(elsewhere, table);
+  BlockingClient linked;
+  auto request = linked.client().request(AXProtocol::kMatch);
+  request[AXProtocol::kFlags] = Value::unsignedInteger(AXProtocol::AXDiscoverAll);
+  EXPECT_EQ(linked.outcome(request), "11: unauthorized discovery flag (AXDiscoverAll)");
 }
 
 }  // namespace
