@@ -5,7 +5,9 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdio>
 #include <cstdlib>
+#include <ctime>
 #include <fstream>
 #include <map>
 
@@ -95,6 +97,7 @@ AXDAnnotationStore::AXDAnnotationStore(const char* path)
   std::optional<AXError> error;
   if (loadDb(&error)) return;
   if (error->domain() == AXPOSIXErrorDomain && error->code() == ENOENT) return;
+  rejected_ = true;
   os::Log::write(5, os::format("unable to load annotation database:%@ error:%@ (resetting)",
                                {annotationsURL_, error->description()}));
 }
@@ -128,9 +131,10 @@ std::optional<value::Dictionary> AXDAnnotationStore::annotationForPlugIn(
   return annotationForIdentifier(plugIn.annotationKey());
 }
 
-void AXDAnnotationStore::setAnnotation(const std::optional<value::Dictionary>& annotation,
-                                       const AXDPlugIn& plugIn) {
+std::optional<AXError> AXDAnnotationStore::setAnnotation(
+    const std::optional<value::Dictionary>& annotation, const AXDPlugIn& plugIn) {
   std::string key = plugIn.annotationKey();
+  value::Dictionary saved = annotations_;
   if (annotation) {
     std::map<std::string, value::Value> merged =
         annotationForIdentifier(key).value_or(value::Dictionary()).toMap();
@@ -140,9 +144,11 @@ void AXDAnnotationStore::setAnnotation(const std::optional<value::Dictionary>& a
     annotations_ = annotations_.without(key);
   }
   std::optional<AXError> error;
-  if (saveDb(&error)) return;
+  if (saveDb(&error)) return std::nullopt;
+  annotations_ = std::move(saved);
   os::Log::write(5, os::format("unable to save annotations:%@ error:%@",
                                {annotationsURL_, error->description()}));
+  return error;
 }
 
 bool AXDAnnotationStore::loadDb(std::optional<AXError>* error) {
@@ -158,6 +164,10 @@ bool AXDAnnotationStore::loadDb(std::optional<AXError>* error) {
 }
 
 bool AXDAnnotationStore::saveDb(std::optional<AXError>* error) {
+  if (std::optional<AXError> kept = rejected_ ? keepRejectedFile() : std::nullopt) {
+    if (error) *error = std::move(kept);
+    return false;
+  }
   value::Value top = value::Value::dictionary({
       {"data", value::Value::dictionary(annotations_)},
       {"version", value::Value::integer(kVersion)},
@@ -170,4 +180,23 @@ bool AXDAnnotationStore::saveDb(std::optional<AXError>* error) {
   if (written.ok()) return true;
   if (error) *error = posixError(written.error());
   return false;
+}
+
+std::optional<AXError> AXDAnnotationStore::keepRejectedFile() {
+  std::string stem = annotationsURL_ + ".rejected-" + std::to_string(std::time(nullptr));
+  for (int attempt = 0;; ++attempt) {
+    std::string aside = attempt == 0 ? stem : stem + "-" + std::to_string(attempt);
+    if (renameat2(AT_FDCWD, annotationsURL_.c_str(), AT_FDCWD, aside.c_str(), RENAME_NOREPLACE) ==
+        0) {
+      os::Log::write(5, os::format("kept rejected annotation database as %@", {aside}));
+      break;
+    }
+    if (errno == ENOENT) break;
+    if (errno != EEXIST || attempt == 100) {
+      return posixError(
+          os::Error::fromErrno("keep the rejected " + annotationsURL_ + " as " + aside));
+    }
+  }
+  rejected_ = false;
+  return std::nullopt;
 }

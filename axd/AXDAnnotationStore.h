@@ -33,7 +33,8 @@ class AXDAnnotationStore {
   // directory); null means defaultDatabaseURL(). Loads the file with loadDb; when that fails
   // the table starts empty and, unless the file does not exist (ENOENT), the line "unable to
   // load annotation database:<path> error:<error> (resetting)" is logged. The file is never
-  // touched here: a rejected file stays until the first change overwrites it.
+  // touched here: a rejected file stays where it is until the first save, which first renames it
+  // aside (see saveDb).
   explicit AXDAnnotationStore(const char* path);
   AXDAnnotationStore(const AXDAnnotationStore&) = delete;
   AXDAnnotationStore& operator=(const AXDAnnotationStore&) = delete;
@@ -53,10 +54,12 @@ class AXDAnnotationStore {
 
   // Merges |annotation| into the entry of |plugIn|'s annotation key: each of its entries
   // replaces the entry of that name, the others stay (an entry is created when there is none).
-  // A null |annotation| removes the whole entry instead. Then saves; a failed save is logged as
-  // "unable to save annotations:<path> error:<error>" and the change stays in memory for the next
-  // save.
-  void setAnnotation(const std::optional<value::Dictionary>& annotation, const AXDPlugIn& plugIn);
+  // A null |annotation| removes the whole entry instead. Then saves. Nothing on success; when
+  // the save fails, the change is undone (what is in memory is what the file holds, so nothing
+  // unsaved is ever shown or acknowledged), "unable to save annotations:<path> error:<error>" is
+  // logged and the save's error returned.
+  std::optional<AXError> setAnnotation(const std::optional<value::Dictionary>& annotation,
+                                       const AXDPlugIn& plugIn);
 
   // Replaces the table with the one in annotationsURL(), less its entries that are not
   // dictionaries, each logged as "skipping annotation "<key>" of <path>: not a dictionary". On
@@ -73,7 +76,10 @@ class AXDAnnotationStore {
   // flushed; a reader, or the file after a crash, is the old content or the new, never a part.
   // Returns true when all of it succeeded; otherwise false, with the error stored in |error|
   // when it is not null, the temporary file removed and the old file unchanged. Directories
-  // are never created here.
+  // are never created here. When the file was rejected at load (another version, damaged, not
+  // a regular file), the first save renames it to "<path>.rejected-<seconds since 1970>" (with
+  // "-<n>" added should that exist) and logs "kept rejected annotation database as <path>"
+  // before writing; a save that cannot keep it fails and writes nothing.
   bool saveDb(std::optional<AXError>* error);
 
   // The path of the annotation file.
@@ -85,6 +91,11 @@ class AXDAnnotationStore {
   void setAnnotations(value::Dictionary annotations) { annotations_ = std::move(annotations); }
 
  private:
+  // Renames the rejected file aside; nothing on success (or when it has gone meanwhile).
+  std::optional<AXError> keepRejectedFile();
+
   std::string annotationsURL_;
   value::Dictionary annotations_;
+  // The file at annotationsURL_ was rejected at load and is not yet kept aside.
+  bool rejected_ = false;
 };

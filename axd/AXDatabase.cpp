@@ -176,10 +176,12 @@ std::optional<value::Dictionary> AXDatabase::annotationForPlugIn(const AXDPlugIn
   return _sync.sync([&] { return annotations_->annotationForPlugIn(plugIn); });
 }
 
-void AXDatabase::setAnnotation(const std::optional<value::Dictionary>& annotation,
-                               const AXDPlugIn& plugIn) {
-  _sync.sync([&] { annotations_->setAnnotation(annotation, plugIn); });
-  postAnnotationChange();
+std::optional<AXError> AXDatabase::setAnnotation(const std::optional<value::Dictionary>& annotation,
+                                                 const AXDPlugIn& plugIn) {
+  std::optional<AXError> failed =
+      _sync.sync([&] { return annotations_->setAnnotation(annotation, plugIn); });
+  if (!failed) postAnnotationChange();
+  return failed;
 }
 
 void AXDatabase::autoElect(const AXDPlugIn& plugIn) {

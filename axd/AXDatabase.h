@@ -80,8 +80,10 @@ class AXDatabase : public registrum::Observer, public std::enable_shared_from_th
   // The annotation of |plugIn|, or nothing. Takes _sync.
   std::optional<value::Dictionary> annotationForPlugIn(const AXDPlugIn& plugIn);
   // Merges |annotation| into the plug-in's annotation (nothing removes it), saves the file, and
-  // posts the annotation-change notification, even when the save failed. Takes _sync.
-  void setAnnotation(const std::optional<value::Dictionary>& annotation, const AXDPlugIn& plugIn);
+  // posts the annotation-change notification. The save's error, with nothing changed and nothing
+  // posted, when the file cannot be written (AXDAnnotationStore::setAnnotation). Takes _sync.
+  std::optional<AXError> setAnnotation(const std::optional<value::Dictionary>& annotation,
+                                       const AXDPlugIn& plugIn);
   // Stores election 1 for |plugIn| unless it has a non-zero election. No notification. The
   // caller must be on _sync.
   void autoElect(const AXDPlugIn& plugIn);

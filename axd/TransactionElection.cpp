@@ -4,6 +4,7 @@
 #include "axd/AXDServer.h"
 #include "axd/AXDZynClient.h"
 #include "axd/Transaction.h"
+#include "platform/os/Format.h"
 #include "platform/value/PropertyList.h"
 
 namespace {
@@ -51,7 +52,13 @@ void Transaction::annotatePlugIns() {
     server()->log("client %d plug-in %@ election := %@",
                   {client()->pid(), plugIn->identifier().value_or("(null)"),
                    election ? election->description() : std::string("(null)")});
-    server()->setAnnotation(annotation, *plugIn);
+    // The client hears of a change that was not saved: it is not kept either.
+    if (std::optional<AXError> unsaved = server()->setAnnotation(annotation, *plugIn)) {
+      fail(AXProtocol::kMalformedRequest,
+           os::format("unable to save annotations: %@",
+                      {unsaved->localizedDescription().value_or("unknown error")}));
+      return false;
+    }
     return true;
   });
   if (stored) done();

@@ -1,6 +1,7 @@
 #include "platform/value/PropertyList.h"
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <plist/plist.h>
 #include <unistd.h>
 
@@ -184,10 +185,18 @@ os::Result<Node> toNode(const Value& value, std::size_t depth) {
   return invalid(os::format("a property list cannot hold %@", {value.description()}));
 }
 
-// The whole file at |path|, refusing more than |limit| bytes.
+// The whole file at |path|, refusing more than |limit| bytes and anything but a regular file: a
+// FIFO or a device put where a property list belongs would otherwise stall the reader for good
+// (it is opened without blocking, so that the check itself cannot).
 os::Result<std::vector<std::uint8_t>> slurp(const std::string& path, std::size_t limit) {
-  int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
+  int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);
   if (fd < 0) return os::Error::fromErrno("open " + path);
+  struct stat status {};
+  if (::fstat(fd, &status) != 0 || !S_ISREG(status.st_mode)) {
+    ::close(fd);
+    int errnum = S_ISDIR(status.st_mode) ? EISDIR : EINVAL;
+    return os::Error{errnum, path + " is not a regular file"};
+  }
   std::vector<std::uint8_t> bytes(std::min<std::size_t>(limit + 1, 64u << 10));
   std::size_t used = 0;
   for (;;) {

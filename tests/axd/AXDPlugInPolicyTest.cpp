@@ -122,7 +122,8 @@ TEST_F(AXDPlugInPolicyTest, TheFirstRefusalWins) {
       {{{"x", Value::boolean(true)}}, "a.b.g", S("x"), ""},
       {{{"x", Value::real(0.5)}}, "a.b.g", S("x"), ""},
       {{{"x", S("")}}, "a.b.g", S("x"), ""},
-      {{}, "a.b.h", Value::boolean(true), ""},  // a demand that names nothing demands nothing
+      // A demand that names nothing cannot be met by any host.
+      {{}, "a.b.h", Value::boolean(true), "the plug-in's host entitlement demand is malformed"},
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(Value::dictionary(c.entitlements).description() + " " + c.identifier);
