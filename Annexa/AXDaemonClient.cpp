@@ -19,7 +19,8 @@ Value pathsValue(const std::vector<std::string>& paths) {
 }  // namespace
 
 AXDaemonClient::AXDaemonClient(const char* serviceName)
-    : replyQueue_(std::make_shared<zyn::StrandQueue>("axd_client")),
+    : replyQueue_(std::make_shared<zyn::StrandQueue>(
+          "axd_client", std::make_shared<zyn::EventLoop>("axd_client"))),
       axd_(zyn::Connection::toService(serviceName ? serviceName : defaultServiceName(),
                                       replyQueue_)) {
   axd_->setEventHandler([](const zyn::Event& event) {

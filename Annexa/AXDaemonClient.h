@@ -16,10 +16,19 @@
 
 // The client side of the daemon's protocol: builds each request, sends it with a reply expected
 // and hands the raw reply to the caller's handler. Requests may be sent from any thread; all reply
-// handlers of one client run one at a time, in arrival order, on its "axd_client" queue. A
-// handler must not wait for another reply of the same client (that reply would queue behind it).
+// handlers of one client run one at a time, in arrival order, on its "axd_client" queue.
+//
+// Each client has an I/O thread of its own, which reads its replies and runs their handlers
+// itself, so a reply costs no further thread hand-off. Clients therefore never wait for one
+// another: a handler may block, or wait for the reply of another client, and only its own
+// client's later replies wait meanwhile. A handler must not wait for a reply of its own client:
+// that reply is read by the very thread the handler holds, so the wait never ends (a handler can
+// tell with replyQueue()->isCurrent()). Destroying a client from one of its own handlers is fine.
+//
 // The connection is made once and never replaced: after it breaks, every request's handler gets
-// the message service's error, which errorInReply() turns into code 4.
+// the message service's error, which errorInReply() turns into code 4. A request whose frame
+// would be over the frame limit is not sent; its handler gets the message service's
+// "request too large (N bytes, limit M)", also code 4, and the connection goes on.
 class AXDaemonClient {
  public:
   using Request = std::map<std::string, value::Value>;

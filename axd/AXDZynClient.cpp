@@ -44,6 +44,8 @@ void AXDZynClient::handleEvent(const zyn::Event& event) {
       case zyn::ErrorKind::ConnectionInvalid:
         dead();
         return;
+      case zyn::ErrorKind::MessageTooLarge:
+        break;
     }
     server_->log("unexpected error %@", {error->description});
     return;

@@ -75,7 +75,18 @@ void Transaction::done() {
     std::string text = reply_.body().description();
     os::Probes::requestOutput(client_->pid(), text.c_str());
   }
-  if (auto connection = this->connection()) connection->send(reply_);
+  auto connection = this->connection();
+  if (!connection) return;
+  os::Status sent = connection->send(reply_);
+  if (sent.ok()) return;
+  server()->log("not sending the reply to client %d: %@", {client_->pid(), sent.error().message});
+  // Sent as it is: however small the limit, it leaves room for this.
+  reply_.clear();
+  reply_.set(
+      AXProtocol::kErrorCode,
+      value::Value::unsignedInteger(static_cast<std::uint64_t>(AXProtocol::kMalformedRequest)));
+  reply_.set(AXProtocol::kError, value::Value::string(sent.error().message));
+  static_cast<void>(connection->send(reply_));
 }
 
 void Transaction::fail(std::int64_t code, const std::optional<std::string>& message) {

@@ -31,7 +31,9 @@ class Transaction {
   // Serves the request. Called once, on the service queue.
   void dispatch();
 
-  // Sends the reply with the fields set so far (dropped when the connection is gone).
+  // Sends the reply with the fields set so far (dropped when the connection is gone). A reply
+  // over the frame limit is logged and replaced by a failure with code 4 and the message
+  // "reply too large (N bytes, limit M)"; the connection goes on.
   void done();
   // Sets "errorcode" (and "error" when there is a message), then done().
   void fail(std::int64_t code, const std::optional<std::string>& message);

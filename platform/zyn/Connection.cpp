@@ -10,7 +10,6 @@
 #include "platform/os/Log.h"
 #include "platform/os/Paths.h"
 #include "platform/os/Process.h"
-#include "platform/zyn/Runtime.h"
 
 namespace zyn {
 
@@ -22,28 +21,47 @@ ServiceError invalidError(const std::string& why) {
   return ServiceError{ErrorKind::ConnectionInvalid, "Connection invalid: " + why};
 }
 
+const char* kindName(FrameKind kind) {
+  switch (kind) {
+    case FrameKind::Request:
+      return "request";
+    case FrameKind::Reply:
+      return "reply";
+    case FrameKind::OneWay:
+      return "message";
+    case FrameKind::Control:
+      break;
+  }
+  return "control message";
+}
+
 }  // namespace
 
 std::shared_ptr<Connection> Connection::toService(std::string serviceName,
                                                   std::shared_ptr<StrandQueue> queue) {
-  asio::local::stream_protocol::socket socket(Runtime::shared().context());
+  asio::local::stream_protocol::socket socket(queue->context());
   return std::shared_ptr<Connection>(new Connection(std::move(socket), PeerCredentials{},
-                                                    std::move(serviceName), std::move(queue)));
+                                                    std::move(serviceName), std::move(queue),
+                                                    FrameLimits::fromEnvironment()));
 }
 
 std::shared_ptr<Connection> Connection::accepted(asio::local::stream_protocol::socket socket,
-                                                 PeerCredentials peer, std::string serviceName) {
+                                                 PeerCredentials peer, std::string serviceName,
+                                                 FrameLimits limits) {
   auto queue = std::make_shared<StrandQueue>("zyn.connection");
   return std::shared_ptr<Connection>(
-      new Connection(std::move(socket), peer, std::move(serviceName), std::move(queue)));
+      new Connection(std::move(socket), peer, std::move(serviceName), std::move(queue), limits));
 }
 
 Connection::Connection(asio::local::stream_protocol::socket socket, PeerCredentials peer,
-                       std::string serviceName, std::shared_ptr<StrandQueue> queue)
-    : socket_(std::move(socket)),
+                       std::string serviceName, std::shared_ptr<StrandQueue> queue,
+                       FrameLimits limits)
+    : queue_(std::move(queue)),
+      socket_(std::move(socket)),
       peer_(peer),
       serviceName_(std::move(serviceName)),
-      queue_(std::move(queue)) {}
+      limits_(limits),
+      decoder_(limits_) {}
 
 Connection::~Connection() {
   if (peer_.pidfd >= 0) close(peer_.pidfd);
@@ -60,7 +78,7 @@ void Connection::setContext(std::shared_ptr<void> context) {
 void Connection::resume() {
   if (!socket_.is_open()) connectToService();
   auto self = shared_from_this();
-  asio::post(Runtime::shared().context(), [self] { self->readMore(); });
+  asio::post(queue_->context(), [self] { self->readMore(); });
 }
 
 void Connection::connectToService() {
@@ -127,21 +145,22 @@ void Connection::received(Frame frame) {
 }
 
 void Connection::receivedReply(Frame frame) {
-  ReplyHandler handler;
-  {
-    std::lock_guard lock(pendingMutex_);
-    auto it = pending_.find(frame.id);
-    if (it != pending_.end()) {
-      handler = std::move(it->second);
-      pending_.erase(it);
-    }
-  }
+  ReplyHandler handler = takePending(frame.id);
   if (!handler) {
     os::Log::write(4, os::format("ignoring reply %llu without a request on connection %@",
                                  {frame.id, description()}));
     return;
   }
   queue_->dispatch([handler = std::move(handler), body = std::move(frame.body)] { handler(body); });
+}
+
+Connection::ReplyHandler Connection::takePending(std::uint64_t id) {
+  std::lock_guard lock(pendingMutex_);
+  auto it = pending_.find(id);
+  if (it == pending_.end()) return nullptr;
+  ReplyHandler handler = std::move(it->second);
+  pending_.erase(it);
+  return handler;
 }
 
 void Connection::invalidate(std::string why) {
@@ -175,12 +194,13 @@ void Connection::deliver(Event event) {
   });
 }
 
-void Connection::send(const Reply& reply) {
-  if (reply.expected()) write(FrameKind::Reply, reply.id(), reply.body());
+os::Status Connection::send(const Reply& reply) {
+  if (!reply.expected()) return os::success();
+  return write(FrameKind::Reply, reply.id(), reply.body());
 }
 
-void Connection::sendMessage(const value::Value& body) {
-  write(FrameKind::OneWay, 0, body);
+os::Status Connection::sendMessage(const value::Value& body) {
+  return write(FrameKind::OneWay, 0, body);
 }
 
 void Connection::sendWithReply(const value::Value& body, ReplyHandler handler) {
@@ -193,41 +213,55 @@ void Connection::sendWithReply(const value::Value& body, ReplyHandler handler) {
     }
     pending_.emplace(id, std::move(handler));
   }
-  write(FrameKind::Request, id, body);
+  os::Status sent = write(FrameKind::Request, id, body);
+  if (sent.ok()) return;
+  // Unless the connection ended meanwhile and answered it already.
+  if (ReplyHandler refused = takePending(id)) {
+    ServiceError error{ErrorKind::MessageTooLarge, sent.error().message};
+    queue_->async([refused = std::move(refused), error] { refused(error); });
+  }
 }
 
 void Connection::cancel() {
-  write(FrameKind::Control, 0,
-        value::Value::dictionary({{"control", value::Value::string("goodbye")}}));
+  static_cast<void>(
+      write(FrameKind::Control, 0,
+            value::Value::dictionary({{"control", value::Value::string("goodbye")}})));
   std::lock_guard lock(writeMutex_);
   shutdownSocket();
 }
 
-void Connection::write(FrameKind kind, std::uint64_t id, const value::Value& body) {
+os::Status Connection::write(FrameKind kind, std::uint64_t id, const value::Value& body) {
   std::vector<std::uint8_t> bytes;
   encodeFrame(Frame{kind, id, body}, bytes);
+  // The length field counts what follows its own 4 bytes; the peer refuses more than the limit.
+  std::size_t length = bytes.size() - 4;
+  if (length > limits_.maxFrameBytes) {
+    return os::Error{EMSGSIZE, os::format("%s too large (%zu bytes, limit %zu)",
+                                          {kindName(kind), length, limits_.maxFrameBytes})};
+  }
   std::lock_guard lock(writeMutex_);
-  if (closed_) return;
+  if (closed_) return os::success();
   std::size_t offset = 0;
-  if (backlog_.empty() && sendNow(bytes, offset)) return;
+  if (backlog_.empty() && sendNow(bytes, offset)) return os::success();
   if (backlog_.empty()) backlogOffset_ = offset;
   backlogBytes_ += bytes.size();
   backlog_.push_back(std::move(bytes));
-  if (backlogBytes_ > kMaxBacklogBytes) {
+  if (backlog_.size() > 1 && backlogBytes_ > kMaxBacklogBytes) {
     os::Log::write(4, os::format("disconnecting %@: more than %zu bytes wait to be sent",
                                  {description(), kMaxBacklogBytes}));
     shutdownSocket();
-    return;
+    return os::success();
   }
   if (!flushing_) {
     flushing_ = true;
     flushLater();
   }
+  return os::success();
 }
 
 void Connection::flushLater() {
   auto self = shared_from_this();
-  asio::post(Runtime::shared().context(), [self] {
+  asio::post(queue_->context(), [self] {
     self->socket_.async_wait(asio::socket_base::wait_write,
                              [self](std::error_code) { self->flush(); });
   });

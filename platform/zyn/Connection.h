@@ -31,26 +31,32 @@ struct PeerCredentials {
 
 // One connection of the message service, either end. Events (messages and the two terminal
 // errors) are delivered one at a time, in order, on the connection's queue; reply handlers run
-// on the same queue. Sending is safe from any thread and never blocks: what the socket cannot
-// take at once waits in a bounded backlog, and a peer that lets the backlog grow past its bound
-// is disconnected. A connection stays alive while it is resumed and its socket open; the
-// connection-invalid event is its last.
+// on the same queue, and the connection reads on that queue's I/O thread. Sending is safe from
+// any thread and never blocks: what the socket cannot take at once waits in a bounded backlog,
+// and a peer that lets the backlog grow past its bound is disconnected. A frame over the
+// connection's frame limit is neither read (the connection is closed) nor sent (refused, and the
+// connection goes on). A
+// connection stays alive while it is resumed and its socket open; the connection-invalid event
+// is its last.
 class Connection : public std::enable_shared_from_this<Connection> {
  public:
   using EventHandler = std::function<void(const Event&)>;
   using ReplyHandler = std::function<void(const ReplyOrError&)>;
 
-  // Bytes of unsent replies and messages beyond which the peer is disconnected.
+  // Bytes of unsent replies and messages beyond which the peer is disconnected; one frame alone
+  // (at most the frame limit) is always taken.
   static constexpr std::size_t kMaxBacklogBytes = 64u << 20;
 
   // A connection to the named service; it connects when resumed. Events and reply handlers run
-  // on |queue|.
+  // on |queue|, and the socket is read on its I/O thread. The frame limits are read from the
+  // environment now (FrameLimits::fromEnvironment()).
   static std::shared_ptr<Connection> toService(std::string serviceName,
                                                std::shared_ptr<StrandQueue> queue);
 
   // The daemon's side of an accepted socket (made by Listener).
   static std::shared_ptr<Connection> accepted(asio::local::stream_protocol::socket socket,
-                                              PeerCredentials peer, std::string serviceName);
+                                              PeerCredentials peer, std::string serviceName,
+                                              FrameLimits limits);
 
   ~Connection();
   Connection(const Connection&) = delete;
@@ -65,12 +71,16 @@ class Connection : public std::enable_shared_from_this<Connection> {
   // Starts delivering events; a client connection connects first. Call once.
   void resume();
 
-  // Sends |reply| when its request expected one and the connection still works.
-  void send(const Reply& reply);
-  // Sends a one-way message.
-  void sendMessage(const value::Value& body);
+  // Sends |reply| when its request expected one and the connection still works. An Error
+  // (EMSGSIZE, "reply too large (N bytes, limit M)") when its frame would be over the limit:
+  // nothing is sent, and the caller may send a smaller reply instead.
+  os::Status send(const Reply& reply);
+  // Sends a one-way message; an Error as send() gives, "message too large (...)", sends nothing.
+  os::Status sendMessage(const value::Value& body);
   // Sends a request; |handler| runs once on the connection's queue with the reply, or with
-  // the connection-invalid error when the connection ends first.
+  // the connection-invalid error when the connection ends first. A request over the frame limit
+  // is not sent: |handler| gets the message-too-large error, "request too large (N bytes,
+  // limit M)", and the connection goes on.
   void sendWithReply(const value::Value& body, ReplyHandler handler);
   // Tells the peer that this end is going away (the termination-imminent event on its side)
   // and closes the connection.
@@ -88,26 +98,30 @@ class Connection : public std::enable_shared_from_this<Connection> {
 
  private:
   Connection(asio::local::stream_protocol::socket socket, PeerCredentials peer,
-             std::string serviceName, std::shared_ptr<StrandQueue> queue);
+             std::string serviceName, std::shared_ptr<StrandQueue> queue, FrameLimits limits);
 
   void connectToService();
   void readMore();
   void received(Frame frame);
   void receivedReply(Frame frame);
+  // Takes the handler of request |id| out of pending_; null when it is not there.
+  ReplyHandler takePending(std::uint64_t id);
   void invalidate(std::string why);
   void deliver(Event event);
-  void write(FrameKind kind, std::uint64_t id, const value::Value& body);
+  os::Status write(FrameKind kind, std::uint64_t id, const value::Value& body);
   void flushLater();
   void flush();
   bool sendNow(std::vector<std::uint8_t>& bytes, std::size_t& offset);
   void shutdownSocket();
 
+  // Before socket_: the queue may keep the socket's event loop alive, so it must go last.
+  const std::shared_ptr<StrandQueue> queue_;
   asio::local::stream_protocol::socket socket_;
   const PeerCredentials peer_;
   const std::string serviceName_;
-  const std::shared_ptr<StrandQueue> queue_;
   EventHandler handler_;
   std::shared_ptr<void> context_;
+  const FrameLimits limits_;
   FrameDecoder decoder_;
 
   std::mutex pendingMutex_;  // guards pending_ and invalid_

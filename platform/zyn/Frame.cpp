@@ -2,8 +2,10 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <charconv>
 #include <cstdlib>
 #include <cstring>
+#include <string_view>
 
 #include "platform/os/Format.h"
 #include "platform/os/Log.h"
@@ -51,6 +53,24 @@ void encodeFrame(const Frame& frame, std::vector<std::uint8_t>& out) {
     std::abort();
   }
   putBigEndian(&out[start], length, kLengthBytes);
+}
+
+FrameLimits FrameLimits::fromEnvironment() {
+  FrameLimits limits;
+  const char* setting = std::getenv(kMaxFrameBytesVariable);
+  if (!setting) return limits;
+  std::string_view text(setting);
+  std::size_t bytes = 0;
+  auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), bytes);
+  if (error != std::errc() || end != text.data() + text.size() || bytes < kLeastMaxFrameBytes ||
+      bytes > kMostMaxFrameBytes) {
+    os::Log::write(
+        4, os::format("ignoring %s=%s: not a number of bytes from %zu to %zu",
+                      {kMaxFrameBytesVariable, text, kLeastMaxFrameBytes, kMostMaxFrameBytes}));
+    return limits;
+  }
+  limits.maxFrameBytes = bytes;
+  return limits;
 }
 
 FrameDecoder::FrameDecoder(FrameLimits limits) : limits_(limits) {}

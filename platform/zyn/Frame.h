@@ -21,6 +21,17 @@ struct Frame {
 };
 
 struct FrameLimits {
+  // The environment variable that sets maxFrameBytes for the connections of a process.
+  static constexpr const char* kMaxFrameBytesVariable = "AXD_MAX_FRAME_BYTES";
+  // The range a setting of kMaxFrameBytesVariable must fall in: room for any error reply, and
+  // what the 4-byte length field can say.
+  static constexpr std::size_t kLeastMaxFrameBytes = 4096;
+  static constexpr std::size_t kMostMaxFrameBytes = UINT32_MAX;
+
+  // The defaults, with maxFrameBytes from kMaxFrameBytesVariable when that holds a decimal
+  // number in range; any other setting is logged and the default kept.
+  static FrameLimits fromEnvironment();
+
   // Largest length field accepted: the bytes after the 4-byte length (kind, id and item).
   std::size_t maxFrameBytes = 64u << 20;
   // Deepest nesting of arrays, maps and envelopes in an item.

@@ -132,7 +132,8 @@ Listener::Listener(asio::local::stream_protocol::acceptor acceptor, std::string 
       retry_(Runtime::shared().context()),
       serviceName_(std::move(serviceName)),
       path_(std::move(path)),
-      queue_(std::move(queue)) {}
+      queue_(std::move(queue)),
+      limits_(FrameLimits::fromEnvironment()) {}
 
 void Listener::resume() {
   auto self = shared_from_this();
@@ -156,7 +157,7 @@ void Listener::acceptNext() {
 
 void Listener::accepted(asio::local::stream_protocol::socket socket) {
   PeerCredentials peer = credentialsOf(socket.native_handle());
-  auto connection = Connection::accepted(std::move(socket), peer, serviceName_);
+  auto connection = Connection::accepted(std::move(socket), peer, serviceName_, limits_);
   auto self = shared_from_this();
   queue_->async([self, connection] {
     if (self->handler_) self->handler_(connection);

@@ -16,6 +16,7 @@ namespace zyn {
 // 0700, socket 0600), or the listening socket that the service manager handed over through
 // LISTEN_FDS. Each accepted connection is delivered, with its peer's credentials and audit token
 // taken at accept, to the event handler on the listener's queue. Accepting starts at resume().
+// The frame limits of its connections are read from the environment when it is created.
 class Listener : public std::enable_shared_from_this<Listener> {
  public:
   using EventHandler = std::function<void(std::shared_ptr<Connection>)>;
@@ -46,6 +47,7 @@ class Listener : public std::enable_shared_from_this<Listener> {
   const std::string serviceName_;
   const std::string path_;
   const std::shared_ptr<SerialQueue> queue_;
+  const FrameLimits limits_;
   EventHandler handler_;
 };
 

@@ -9,12 +9,16 @@
 namespace zyn {
 
 // The message service's own errors: the two terminal events of a connection, which also stand in
-// for the reply of a request that can no longer be answered.
+// for the reply of a request that can no longer be answered, and the refusal of a request too
+// large to send.
 enum class ErrorKind {
   // The connection is gone: the peer closed it, it broke, or it could not be made.
   ConnectionInvalid,
   // The peer announced an orderly shutdown; the connection still works until it closes.
   TerminationImminent,
+  // Only in place of a reply: the request was not sent, its frame being over the limit. The
+  // connection goes on.
+  MessageTooLarge,
 };
 
 struct ServiceError {

@@ -16,6 +16,8 @@ class Reply {
   explicit Reply(const Message& request) : id_(request.id), expected_(request.expectsReply) {}
 
   void set(std::string key, value::Value v) { fields_[std::move(key)] = std::move(v); }
+  // Removes every field set so far.
+  void clear() { fields_.clear(); }
   // The field under |key|, or null when it is not set.
   const value::Value* find(const std::string& key) const;
 

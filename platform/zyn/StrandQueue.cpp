@@ -10,6 +10,9 @@ namespace zyn {
 StrandQueue::StrandQueue(std::string label)
     : label_(std::move(label)), strand_(Runtime::shared().context()) {}
 
+StrandQueue::StrandQueue(std::string label, std::shared_ptr<EventLoop> loop)
+    : label_(std::move(label)), loop_(std::move(loop)), strand_(loop_->context()) {}
+
 void StrandQueue::async(Work work) {
   asio::post(strand_, std::move(work));
 }

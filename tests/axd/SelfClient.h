@@ -23,7 +23,8 @@ class SelfClient {
     socket.assign(asio::local::stream_protocol(), fds[0]);
     auto pidfd = os::Process::openPidfd(getpid());
     zyn::PeerCredentials peer{getpid(), getuid(), getgid(), pidfd.ok() ? pidfd.value() : -1};
-    auto connection = zyn::Connection::accepted(std::move(socket), peer, "self");
+    auto connection =
+        zyn::Connection::accepted(std::move(socket), peer, "self", zyn::FrameLimits{});
     client_ = AXDZynClient::initWithConnection(connection, AXDServer::server());
   }
   // Closing our end ends the connection, and with it the client.

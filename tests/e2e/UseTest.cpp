@@ -21,6 +21,7 @@
 #include "platform/sandbox/Sandbox.h"
 #include "tests/e2e/Bundles.h"
 #include "tests/e2e/DaemonTest.h"
+#include "tests/platform/ScopedEnvironment.h"
 
 namespace {
 
@@ -217,6 +218,28 @@ TEST_F(UseTest, AccessIssuesOneReadTokenPerPlugInInOrder) {
             Dictionary({{AXProtocol::kExtensions, Value::array({token(two), token(one)})}}));
   EXPECT_EQ(send(AXProtocol::kAccess, {uuid(one), Uuid::random()}),
             "4: no such plugin (uuid not found)");
+}
+
+// An access for many plug-ins builds a large reply: one over the frame limit is answered with an
+// error, and a request over the client's limit is not sent; the connection goes on after both.
+TEST_F(UseTest, WhatWouldBeOverTheFrameLimitIsRefusedAndTheConnectionGoesOn) {
+  ScopedEnvironment environment;
+  environment.set("AXD_MAX_FRAME_BYTES", "16384");  // for the daemon and for this client
+  ASSERT_TRUE(start());
+  Uuid one = uuid(install("Host", {.id = "access.one"}));
+  auto access = [&](std::size_t copies) {
+    return send(AXProtocol::kAccess, std::vector<Uuid>(copies, one));
+  };
+  // A token is about 200 bytes; 20 UUIDs ask for about 400.
+  EXPECT_TRUE(access(20).starts_with("ok {")) << access(20);
+  std::string refused = access(200);
+  EXPECT_TRUE(refused.starts_with("4: reply too large (")) << refused;
+  EXPECT_TRUE(refused.ends_with(" bytes, limit 16384)")) << refused;
+  EXPECT_EQ(logCount("not sending the reply to " + thisClient() + ": reply too large ("), 1u);
+  refused = access(1000);
+  EXPECT_TRUE(refused.starts_with("service error: request too large (")) << refused;
+  EXPECT_TRUE(refused.ends_with(" bytes, limit 16384)")) << refused;
+  EXPECT_EQ(client().bulk(0), "ok");
 }
 
 // Holds and their release are tested in-process; here, the lock request's paths, flags and

@@ -1,9 +1,12 @@
 // What reaches the daemon over its socket: the request envelope and bulk, and what clients may
 // send that the client library never would: broken frames, messages that are no requests, and
-// connections that end or say goodbye. The daemon must survive all of it.
+// connections that end or say goodbye. The daemon must survive all of it. And, on the client's
+// side, clients of one process that never wait for one another.
 
 #include <cstdint>
 #include <future>
+#include <memory>
+#include <mutex>
 #include <optional>
 #include <span>
 #include <string>
@@ -143,6 +146,48 @@ TEST_F(DaemonTest, AClientThatLeavesInTheMiddleOfAFrameDisturbsNoOther) {
   EXPECT_EQ(client().bulk(3), "ok");
   expectServing();
   EXPECT_EQ(logCount("bulk options 0x4a1f"), 0u);
+}
+
+// Two clients of one process: a handler of the first may wait for a reply of the second, and a
+// handler that blocks holds up only its own client, whose replies then run in order.
+TEST_F(DaemonTest, EachClientRunsItsHandlersOnAQueueOfItsOwn) {
+  ASSERT_TRUE(start());
+  AXDaemonClient& first = client().client();
+  BlockingClient second;
+  // Shared: handlers that outlive a failed wait must still find their state.
+  struct State {
+    std::promise<std::string> nested;
+    std::promise<void> gate;
+    std::mutex mutex;
+    std::vector<int> order;
+    std::promise<void> drained;
+  };
+  auto state = std::make_shared<State>();
+
+  first.bulkPlugins(
+      0, [state, &second](const zyn::ReplyOrError&) { state->nested.set_value(second.bulk(0)); });
+  auto nested = state->nested.get_future();
+  ASSERT_EQ(nested.wait_for(BlockingClient::kReplyTimeout), std::future_status::ready);
+  EXPECT_EQ(nested.get(), "ok");
+
+  std::shared_future<void> gate = state->gate.get_future().share();
+  constexpr int kReplies = 4;
+  for (int i = 0; i < kReplies; ++i) {
+    first.bulkPlugins(0, [state, gate, i](const zyn::ReplyOrError&) {
+      if (i == 0) gate.wait();
+      std::lock_guard lock(state->mutex);
+      state->order.push_back(i);
+      if (i == kReplies - 1) state->drained.set_value();
+    });
+  }
+  // The first client's handler holds its queue until the gate opens; the second is served.
+  EXPECT_EQ(second.bulk(0), "ok");
+  EXPECT_EQ(second.bulk(1), "ok");
+  state->gate.set_value();
+  auto drained = state->drained.get_future();
+  ASSERT_EQ(drained.wait_for(BlockingClient::kReplyTimeout), std::future_status::ready);
+  std::lock_guard lock(state->mutex);
+  EXPECT_EQ(state->order, std::vector<int>({0, 1, 2, 3}));
 }
 
 }  // namespace

@@ -93,6 +93,40 @@ TEST(ConnectionTest, RepliesReachTheRequestTheyAnswerWhateverTheirOrder) {
   client->cancel();
 }
 
+// A frame of exactly the limit passes, both its sender's check and its reader's; one byte more
+// is not sent, and the connection goes on.
+TEST(ConnectionTest, TheFrameLimitHoldsForSendingAsForReading) {
+  ScopedEnvironment environment;
+  environment.set("AXD_MAX_FRAME_BYTES", "16384");
+  Service service([](zyn::Connection& connection, const zyn::Event& event) {
+    const auto* message = std::get_if<zyn::Message>(&event);
+    if (!message) return;
+    zyn::Reply reply(*message);
+    reply.set("bytes", Value::unsignedInteger(message->body.asData()->size()));
+    connection.send(reply);
+  });
+  auto client = zyn::Connection::toService("test.zyn", std::make_shared<zyn::StrandQueue>("c"));
+  client->setEventHandler([](const zyn::Event&) {});
+  client->resume();
+  // A frame of n data bytes (256 <= n < 65536) is 9 header bytes, a 3-byte head and the data.
+  const std::vector<std::pair<std::size_t, std::string>> cases = {
+      {16384 - 13, "16371"},
+      {16384 - 12, "16372"},
+      {16384 - 11, "request too large (16385 bytes, limit 16384)"},
+      {256, "256"},
+  };
+  for (const auto& [bytes, expected] : cases) {
+    std::promise<std::string> outcome;
+    client->sendWithReply(Value::data(value::Data(bytes, 0x5a)), [&](const zyn::ReplyOrError& r) {
+      const auto* body = std::get_if<Value>(&r);
+      outcome.set_value(body ? body->asDictionary()->find("bytes")->description()
+                             : std::get<zyn::ServiceError>(r).description);
+    });
+    EXPECT_EQ(outcome.get_future().get(), expected);
+  }
+  client->cancel();
+}
+
 TEST(ConnectionTest, APeerThatDoesNotReadIsDisconnectedAtTheBacklogBound) {
   std::promise<void> invalid;
   Service service([&](zyn::Connection& connection, const zyn::Event& event) {
