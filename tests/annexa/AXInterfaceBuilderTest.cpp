@@ -32,14 +32,6 @@ class AXInterfaceBuilder : public ::testing::Test {
     return AXConfigureInterface(interface, "call:", specification);
   }
 
-  static std::vector<std::string> classNames(const MessageInterface::ClassSet* classes) {
-    std::vector<std::string> names;
-    if (classes) {
-      for (const auto& c : *classes) names.push_back(c->name());
-    }
-    return names;
-  }
-
   MessageInterface interface { Runtime::shared().lookUpProtocol("HostProtocol") };
 };
 
@@ -48,22 +40,6 @@ void expectMalformed(const std::optional<AXError>& error, const std::string& mes
   EXPECT_EQ(error->domain(), "Annexa");
   EXPECT_EQ(error->code(), 6);
   EXPECT_EQ(error->localizedDescription(), message);
-}
-
-TEST_F(AXInterfaceBuilder, EntriesSetClassesOrNestedInterfacesPerDirection) {
-  EXPECT_FALSE(configure("request:0:{ClassA+ClassB},reply:1:{ClassA},request:2:ToolProtocol"));
-  using Names = std::vector<std::string>;
-  EXPECT_EQ(classNames(interface.classes("call:", 0, false)), (Names{"ClassA", "ClassB"}));
-  EXPECT_EQ(classNames(interface.classes("call:", 1, true)), (Names{"ClassA"}));
-  EXPECT_EQ(interface.classes("call:", 1, false), nullptr);
-  auto nested = interface.interface("call:", 2, false);
-  ASSERT_TRUE(nested);
-  EXPECT_EQ(nested->protocol()->name(), "ToolProtocol");
-
-  // The index reads like a C integer: leading digits count, other text is 0.
-  EXPECT_FALSE(configure("reply:7th:{ClassB},reply:x:{ClassB}"));
-  EXPECT_EQ(classNames(interface.classes("call:", 7, true)), (Names{"ClassB"}));
-  EXPECT_EQ(classNames(interface.classes("call:", 0, true)), (Names{"ClassB"}));
 }
 
 TEST_F(AXInterfaceBuilder, MalformedSpecificationsNameTheOffendingPart) {
@@ -125,23 +101,6 @@ TEST_F(AXInterfaceBuilder, AMissingProtocolIsLoggedAndReportedWithCode12) {
   EXPECT_EQ(AXProtocolFromSpec(I(5), &error), nullptr);
   EXPECT_EQ(AXProtocolFromSpec(value::Value(), &error), nullptr);
   EXPECT_FALSE(error);
-}
-
-TEST_F(AXInterfaceBuilder, ACompoundIsMadeOnceAndFoundByName) {
-  Runtime::shared().addProtocol("CompoundA", {}, {"a"});
-  Runtime::shared().addProtocol("CompoundB", {}, {"b"});
-  auto compound = AXProtocolFromSpec(A({S("CompoundA"), S("CompoundB")}));
-  ASSERT_TRUE(compound);
-  EXPECT_EQ(compound->name(), "__XX_COMPOUND__CompoundA__CompoundB");
-  EXPECT_EQ(Runtime::shared().lookUpProtocol(compound->name()), compound);
-  ASSERT_EQ(compound->adoptedProtocols().size(), 2u);
-  EXPECT_EQ(compound->adoptedProtocols()[0]->name(), "CompoundA");
-  EXPECT_TRUE(compound->declares("a") && compound->declares("b"));
-
-  EXPECT_EQ(AXProtocolFromSpec(A({S("CompoundA"), S("CompoundB")})), compound);
-  auto reversed = AXProtocolFromSpec(A({S("CompoundB"), S("CompoundA")}));
-  ASSERT_TRUE(reversed);
-  EXPECT_NE(reversed, compound);
 }
 
 TEST_F(AXInterfaceBuilder, AHalfMadeCompoundIsMadeAgainUnderTheSameName) {

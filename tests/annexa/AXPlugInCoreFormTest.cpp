@@ -1,7 +1,5 @@
 #include <gtest/gtest.h>
 
-#include <set>
-
 #include "Annexa/AXPlugInCore.h"
 #include "LogCapture.h"
 #include "PlugInFixtures.h"
@@ -11,24 +9,6 @@ namespace {
 
 using namespace fixtures;
 using value::Value;
-
-std::set<std::string> keysOf(const value::Dictionary& form) {
-  std::set<std::string> keys;
-  for (const auto& [key, ignored] : form) keys.insert(key);
-  return keys;
-}
-
-const std::set<std::string> kAlwaysWritten = {"hubProtocolVersion",
-                                              "path",
-                                              "systemResident",
-                                              "identifier",
-                                              "original-identifier",
-                                              "version",
-                                              "bundleInfo",
-                                              "info",
-                                              "uuid",
-                                              "lastmodified",
-                                              "annotations"};
 
 // A canonicalised record with every field that export always writes.
 std::shared_ptr<AXPlugInCore> plainRecord() {
@@ -43,25 +23,6 @@ std::shared_ptr<AXPlugInCore> plainRecord() {
   return r;
 }
 
-TEST(AXPlugInCoreExport, AlwaysWrittenKeysKeepTheirTypesAndAbsentValuesAreLeftOut) {
-  auto r = plainRecord();
-  value::Dictionary form = r->exportForm();
-  EXPECT_EQ(keysOf(form), kAlwaysWritten);
-  EXPECT_EQ(form.find("hubProtocolVersion")->type(), value::Type::UInt);
-  EXPECT_EQ(*form.find("lastmodified"), I(-1234));
-  EXPECT_EQ(*form.find("systemResident"), B(false));
-  EXPECT_EQ(*form.find("annotations"), D({}));
-  // The bundle information goes out without its own location.
-  EXPECT_FALSE(form.find("bundleInfo")->asDictionary()->find("QFBundleInfoPlistURL"));
-  EXPECT_TRUE(r->bundleInfoDictionary()->find("QFBundleInfoPlistURL"));
-
-  auto bare = AXPlugInCore::initWithName("id", AXFileURL(kBundlePath), std::nullopt, std::nullopt,
-                                         std::nullopt);
-  EXPECT_EQ(keysOf(bare->exportForm()),
-            (std::set<std::string>{"hubProtocolVersion", "path", "systemResident", "identifier",
-                                   "uuid", "lastmodified", "annotations"}));
-}
-
 TEST(AXPlugInCoreForm, RoundTripKeepsEveryField) {
   auto r = plainRecord();
   r->setOnSystemVolume(true);
@@ -71,12 +32,8 @@ TEST(AXPlugInCoreForm, RoundTripKeepsEveryField) {
   r->setEntitlements(value::Dictionary{{"e", S("v")}});
   r->setLocalizedName("Tool");
   r->setLocalizedContainingName("Host");
-  value::Dictionary form = r->exportForm();
-  std::set<std::string> expectedKeys = kAlwaysWritten;
-  expectedKeys.insert(
-      {"entitlements", "containingPath", "localizedDisplayName", "localizedContainingDisplayName"});
-  EXPECT_EQ(keysOf(form), expectedKeys);
-  form = form.with("hash", Value::data({1, 2, 3})).with("requirement", S("req"));
+  value::Dictionary form =
+      r->exportForm().with("hash", Value::data({1, 2, 3})).with("requirement", S("req"));
 
   // Through the property-list form too: unsigned integers come back as Int there.
   for (const value::Dictionary& candidate :
@@ -155,15 +112,6 @@ TEST(AXPlugInCoreForm, SetupFailuresAreTheBaseSetupFailures) {
               std::string::npos)
         << log.text();
   }
-}
-
-TEST(AXPlugInCoreForm, UpdateReplacesOrClearsAnnotations) {
-  auto r = plainRecord();
-  r->setAnnotations(value::Dictionary{{"election", I(1)}});
-  r->updateFromForm(value::Dictionary{{"annotations", D({{"election", I(2)}})}});
-  EXPECT_EQ(r->annotations(), (value::Dictionary{{"election", I(2)}}));
-  r->updateFromForm(value::Dictionary{});
-  EXPECT_FALSE(r->annotations());
 }
 
 }  // namespace

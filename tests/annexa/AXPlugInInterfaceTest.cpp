@@ -24,8 +24,6 @@ class AXPlugInInterfaceMake : public ::testing::Test {
  protected:
   static void SetUpTestSuite() {
     Runtime::shared().addProtocol("ShareProtocol", {}, {"share:progress:"});
-    Runtime::shared().addProtocol("CancelProtocol", {}, {"cancel"});
-    Runtime::shared().addProtocol("ProgressProtocol", {}, {"report:"});
   }
 
   static std::optional<AXError> failure(
@@ -35,27 +33,6 @@ class AXPlugInInterfaceMake : public ::testing::Test {
     return error;
   }
 };
-
-TEST_F(AXPlugInInterfaceMake, ConfiguresTheInterfaceOfTheManifestsProtocol) {
-  auto form = formOf(D({{"QSExtensionProtocol", A({S("ShareProtocol"), S("CancelProtocol")})}}));
-  std::optional<AXError> error;
-  auto interface = AXPlugInInterface::make(
-      form, {{"share:progress:", "request:0:{String},request:1:ProgressProtocol"}}, &error);
-  ASSERT_TRUE(interface) << error->description();
-  EXPECT_EQ(interface->protocol()->name(), "__XX_COMPOUND__ShareProtocol__CancelProtocol");
-
-  auto progress = runtime::Argument::proxy(Runtime::shared().lookUpProtocol("ProgressProtocol"));
-  EXPECT_TRUE(interface->checkArguments("share:progress:", false, {S("hello"), progress}).ok());
-  os::Status refused = interface->checkArguments("share:progress:", false, {I(42), progress});
-  ASSERT_FALSE(refused.ok());
-  EXPECT_EQ(refused.error().message, "argument 0 of share:progress: must be one of String, not 42");
-  EXPECT_TRUE(interface->checkArguments("cancel", false, {}).ok());
-
-  // An app extension that names no protocol speaks the root protocol.
-  auto root = AXPlugInInterface::make(formOf(D({})), {});
-  ASSERT_TRUE(root);
-  EXPECT_EQ(root->protocol()->name(), "QSObject");
-}
 
 TEST_F(AXPlugInInterfaceMake, RefusesWhatCannotBeTalkedTo) {
   EXPECT_EQ(failure(value::Dictionary())->code(), 4);

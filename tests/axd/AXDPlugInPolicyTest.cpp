@@ -1,12 +1,10 @@
-// The plug-in record's decisions that need the running server: the election its rules read, the
-// access policy toward a real client, and the consent services of its application.
+// The plug-in record's decisions that need the running server: the election its rules read and
+// the access policy toward a real client.
 
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <filesystem>
 #include <fstream>
-#include <set>
 #include <string>
 
 #include "axd/AXDNames.h"
@@ -28,17 +26,12 @@ class AXDPlugInPolicyTest : public ::testing::Test {
   void SetUp() override {
     server_ = InProcessServer::shared().built();
     ASSERT_TRUE(server_);
-    since_ = InProcessServer::shared().logSize();
   }
-  void TearDown() override {
-    std::filesystem::remove(grantFile());
-    std::filesystem::remove(consentFile());
-  }
+  void TearDown() override { std::filesystem::remove(grantFile()); }
 
   static std::string root() { return InProcessServer::shared().root(); }
   // Sorts before the other tests' table files, so its grants win while it exists.
   static std::string grantFile() { return root() + "/etc/annexa/entitlements.d/0-policy.plist"; }
-  static std::string consentFile() { return root() + "/var/db/consent.plist"; }
 
   static void writePlist(const std::string& path, const Value& plist) {
     std::filesystem::create_directories(std::filesystem::path(path).parent_path());
@@ -46,15 +39,13 @@ class AXDPlugInPolicyTest : public ::testing::Test {
     std::filesystem::permissions(path, std::filesystem::perms(0644));
   }
 
-  // A plug-in |identifier| in the application |app| under the root (the system volume when
-  // |app| is empty), demanding the host entitlement |demanded| when given.
+  // A plug-in |identifier| in an application under the root, demanding the host entitlement
+  // |demanded| when given.
   static std::shared_ptr<AXDPlugIn> record(const std::string& identifier,
-                                           std::optional<Value> demanded = std::nullopt,
-                                           const std::string& app = "Apps/Policy.app") {
-    std::string appPath = root() + "/" + app;
-    PlugInRecord::Fields fields = plugIn(app.empty() ? root() + "/System/Library/Tool.appex"
-                                                     : appPath + "/PlugIns/Tool.appex");
-    if (!app.empty()) fields.containingApplication = application(appPath);
+                                           std::optional<Value> demanded = std::nullopt) {
+    std::string appPath = root() + "/Apps/Policy.app";
+    PlugInRecord::Fields fields = plugIn(appPath + "/PlugIns/Tool.appex");
+    fields.containingApplication = application(appPath);
     fields.plugInIdentifier = identifier;
     if (demanded) {
       fields.plugInDictionary =
@@ -78,7 +69,6 @@ class AXDPlugInPolicyTest : public ::testing::Test {
   }
 
   std::shared_ptr<AXDServer> server_;
-  std::size_t since_ = 0;
 };
 
 TEST_F(AXDPlugInPolicyTest, TheElectionIsMatchedWithoutItsSecondByte) {
@@ -129,47 +119,6 @@ TEST_F(AXDPlugInPolicyTest, TheFirstRefusalWins) {
     SCOPED_TRACE(Value::dictionary(c.entitlements).description() + " " + c.identifier);
     EXPECT_EQ(refusal(c.entitlements, *record(c.identifier, c.demanded)), c.expected);
   }
-}
-
-TEST_F(AXDPlugInPolicyTest, ConsentServicesAreTheGrantedOnesOfTheApplication) {
-  for (const char* app : {"Consent", "Broken"}) {
-    writePlist(root() + "/Apps/" + app + ".app/Info.plist",
-               Value::dictionary({{"QFBundleIdentifier", S(std::string("com.example.") + app)}}));
-  }
-  writePlist(root() + "/Apps/Anonymous.app/Info.plist", D({}));
-  auto plugIn = record("policy.consent", std::nullopt, "Apps/Consent.app");
-  auto entry = [](const char* service, std::optional<bool> granted) {
-    Dictionary fields{{"Service", S(service)}};
-    return Value::dictionary(granted ? fields.with("Granted", Value::boolean(*granted)) : fields);
-  };
-  EXPECT_EQ(plugIn->allowedPCXServices(), std::set<std::string>{});
-  writePlist(consentFile(),
-             D({{"com.example.Consent", A({entry("network", true), entry("camera", false),
-                                           entry("microphone", std::nullopt)})},
-                {"com.example.Broken", S("network")}}));
-  EXPECT_EQ(plugIn->allowedPCXServices(), std::set<std::string>{"network"});
-  // Read afresh at every call.
-  writePlist(consentFile(), D({{"com.example.Consent", A({entry("camera", true)})},
-                               {"com.example.Broken", S("network")}}));
-  EXPECT_EQ(plugIn->allowedPCXServices(), std::set<std::string>{"camera"});
-
-  // Nothing outside an application, nor when the application or its entries cannot be read.
-  EXPECT_TRUE(record("policy.system", std::nullopt, "")->allowedPCXServices().empty());
-  auto missing = record("policy.missing", std::nullopt, "Apps/Missing.app");
-  EXPECT_TRUE(missing->allowedPCXServices().empty());
-  EXPECT_TRUE(
-      record("policy.anonymous", std::nullopt, "Apps/Anonymous.app")->allowedPCXServices().empty());
-  EXPECT_TRUE(
-      record("policy.broken", std::nullopt, "Apps/Broken.app")->allowedPCXServices().empty());
-  auto& log = InProcessServer::shared();
-  EXPECT_TRUE(log.waitForLog("failed to create bundle for " + missing->path(), since_));
-  EXPECT_TRUE(log.waitForLog("PCXAccessCopyInformationForBundle failed for", since_));
-  auto lines = log.logLines(since_);
-  EXPECT_EQ(std::count_if(lines.begin(), lines.end(),
-                          [](const std::string& line) {
-                            return line.starts_with("PCXAccessCopyInformationForBundle failed for");
-                          }),
-            2);
 }
 
 }  // namespace

@@ -81,18 +81,6 @@ TEST_F(AXDatabaseTest, TheCacheIsDroppedWholeWhenItOutgrowsItsLimit) {
   EXPECT_EQ(server_->cachedCount(), 5u);
 }
 
-TEST_F(AXDatabaseTest, ARecordIsBuiltOnceButAMisconfiguredOneOnEveryLookup) {
-  auto good = shelf_->add("Once", "once.good", "test.once");
-  auto bad = shelf_->add("Once", "once.bad", "test.once", {}, /*dataContainer=*/false);
-  auto first = server_->findPlugIn(good->uuid());
-  EXPECT_EQ(server_->findPlugIn(good->uuid()), first);
-  std::size_t cached = server_->cachedCount();
-  EXPECT_FALSE(server_->findPlugIn(bad->uuid()));
-  EXPECT_FALSE(server_->findPlugIn(bad->uuid()));
-  EXPECT_EQ(logCount("ignoring mis-configured plug-in at " + *bad->bundlePath()), 2u);
-  EXPECT_EQ(server_->cachedCount(), cached);
-}
-
 TEST_F(AXDatabaseTest, TheElectionEntryRestrictsTheQuery) {
   const std::string point = "test.election";
   annotate(shelf_->add("Elect", "elect.one", point), {{"election", Value::integer(1)}});
@@ -122,17 +110,6 @@ TEST_F(AXDatabaseTest, TheElectionEntryRestrictsTheQuery) {
   }
 }
 
-TEST_F(AXDatabaseTest, PlugInsThatShareAnAnnotationKeyAreElectedTogether) {
-  const std::string point = "test.shared";
-  auto original = shelf_->add("Share", "shared.original", point);
-  shelf_->add("Share", "shared.replacement", point,
-              {{AXDNames::kReplacePlugInEntitlement, Value::string("shared.original")}});
-  annotate(original, {{"election", Value::integer(1)}});
-  EXPECT_EQ(found({{"QSExtensionPointIdentifier", Value::string(point)},
-                   {"QSUserElection", Value::string("1")}}),
-            (std::set<std::string>{"shared.original", "shared.replacement"}));
-}
-
 TEST_F(AXDatabaseTest, AutoElectionElectsOnceAndKeepsTheRestOfTheAnnotation) {
   const Dictionary autoElect{{AXDNames::kAutoElectEntitlement, Value::boolean(true)}};
   auto fresh = shelf_->add("Auto", "auto.fresh", "test.auto", autoElect);
@@ -154,34 +131,6 @@ TEST_F(AXDatabaseTest, AutoElectionElectsOnceAndKeepsTheRestOfTheAnnotation) {
   auto kept = server_->annotationForPlugIn(*server_->findPlugIn(cleared->uuid()));
   EXPECT_EQ(*kept->find("extension"), Value::dictionary(extension));
   EXPECT_EQ(notify::Notification::count(AXDNames::kAnnotationChangeNotification).value(), posted);
-}
-
-TEST_F(AXDatabaseTest, ApplicationsAnswerNothingOnlyWhenTheyHaveNoPlugIns) {
-  EXPECT_FALSE(server_->plugInsWithinApplication(*shelf_ / "Unknown.app"));
-  auto bad = shelf_->add("OnlyBad", "only.bad", "test.apps", {}, /*dataContainer=*/false);
-  auto plugIns = server_->plugInsWithinApplication(bad->containingApplication()->path());
-  ASSERT_TRUE(plugIns);
-  EXPECT_TRUE(plugIns->empty());
-
-  std::string empty = *shelf_ / "Empty.app";
-  std::filesystem::create_directories(empty + "/PlugIns");
-  std::ofstream(empty + "/Info.plist")
-      << value::PropertyList::toXml(Value::dictionary({{"QFBundleIdentifier", Value::string("e")}}))
-             .value();
-  ASSERT_TRUE(server_->workspace()->installApplication(empty).ok());
-  EXPECT_FALSE(server_->plugInsWithinApplication(empty));
-}
-
-TEST_F(AXDatabaseTest, APlaceholderHidesItsPlugInsFromQueriesButNotFromLookups) {
-  std::string app = *shelf_ / "Pending.app";
-  shelf_->write("Pending", "pending.plugin", "test.pending");
-  std::ofstream(app + "/Info.plist")
-      << value::PropertyList::toXml(Value::dictionary({{"QFBundleIdentifier", Value::string("p")}}))
-             .value();
-  ASSERT_TRUE(server_->workspace()->installApplication(app, {.placeholder = true}).ok());
-  EXPECT_TRUE(found({{"QSExtensionPointIdentifier", Value::string("test.pending")}}).empty());
-  auto rgData = server_->workspace()->plugInAtPath(app + "/PlugIns/pending.plugin.appex").value();
-  EXPECT_TRUE(server_->findPlugIn(rgData->uuid()));
 }
 
 TEST_F(AXDatabaseTest, AnInconsistentRegistryRowIsSkippedAndLogged) {

@@ -11,65 +11,6 @@ using runtime::Protocol;
 using runtime::Runtime;
 using value::Value;
 
-TEST(ObjectRuntime, ConformanceAndSelectorsFollowAdoptionAtAnyDepth) {
-  Runtime rt;
-  auto base = rt.addProtocol("Base", {}, {"ping"});
-  auto middle = rt.addProtocol("Middle", {"Base"}, {"work:"});
-  auto top = rt.addProtocol("Top", {"Middle"}, {});
-  auto other = rt.addProtocol("Other", {}, {"ping"});
-  ASSERT_TRUE(base && middle && top && other);
-  EXPECT_TRUE(top->conformsTo(*base));
-  EXPECT_TRUE(top->declares("ping"));
-  EXPECT_TRUE(top->declares("work:"));
-  EXPECT_FALSE(base->conformsTo(*top));
-  EXPECT_FALSE(top->conformsTo(*other));  // same selectors, another protocol
-  EXPECT_FALSE(top->declares("work"));
-}
-
-TEST(ObjectRuntime, RegistrationKeepsTheFirstOfEachName) {
-  Runtime rt;
-  EXPECT_EQ(rt.addProtocol("NeedsMissing", {"Missing"}, {}), nullptr);
-  EXPECT_EQ(rt.lookUpProtocol("NeedsMissing"), nullptr);
-
-  auto first = rt.addProtocol("P", {}, {"a"});
-  EXPECT_EQ(rt.addProtocol("P", {}, {"b"}), first);
-  EXPECT_FALSE(first->declares("b"));
-  EXPECT_EQ(rt.allocateProtocol("P"), nullptr);
-
-  auto stringClass = rt.lookUpClass("String");
-  ASSERT_TRUE(stringClass);
-  EXPECT_EQ(rt.addClass("String", [](const Value&) { return true; }), stringClass);
-  EXPECT_FALSE(stringClass->isInstance(Value::integer(1)));
-  EXPECT_EQ(rt.lookUpClass("string"), nullptr);
-}
-
-TEST(ObjectRuntime, ARegisteredProtocolNoLongerChangesAndOnlyRegisteredOnesAreAdopted) {
-  Runtime rt;
-  auto first = rt.allocateProtocol("First");
-  auto second = rt.allocateProtocol("Second");
-  // Two new protocols adopting each other would make a cycle that conformance never leaves.
-  EXPECT_FALSE(first->addProtocol(second));
-  EXPECT_TRUE(first->addSelector("a"));
-  auto registered = rt.registerProtocol(first);
-  EXPECT_TRUE(second->addProtocol(registered));
-  EXPECT_FALSE(first->addSelector("b"));
-  EXPECT_FALSE(first->addProtocol(rt.registerProtocol(second)));
-  EXPECT_FALSE(registered->declares("b"));
-  EXPECT_TRUE(rt.lookUpProtocol("Second")->conformsTo(*registered));
-}
-
-TEST(ObjectRuntime, UnregisteredProtocolsAreNotFoundAndDoNotReserveTheirName) {
-  Runtime rt;
-  auto a = rt.allocateProtocol("Q");
-  auto b = rt.allocateProtocol("Q");
-  ASSERT_TRUE(a && b);
-  EXPECT_EQ(rt.lookUpProtocol("Q"), nullptr);
-  std::shared_ptr<const Protocol> winner = a;
-  EXPECT_EQ(rt.registerProtocol(a), winner);
-  EXPECT_EQ(rt.registerProtocol(b), winner);  // the loser of a race gets the winner
-  EXPECT_EQ(rt.lookUpProtocol("Q"), winner);
-}
-
 class MessageInterfaceCheck : public ::testing::Test {
  protected:
   MessageInterfaceCheck() {

@@ -7,7 +7,6 @@
 
 #include "ScopedEnvironment.h"
 #include "TempDirectory.h"
-#include "platform/consent/ConsentStore.h"
 #include "platform/prefs/Preferences.h"
 #include "tests/annexa/LogCapture.h"
 
@@ -47,22 +46,6 @@ class PreferencesTest : public ::testing::Test {
   const std::string directory_ = "var/users/" + std::to_string(geteuid()) + "/Preferences";
 };
 
-TEST_F(PreferencesTest, ChangesByAnotherProgramAreSeenAtTheNextSynchronize) {
-  ASSERT_TRUE(Preferences::setValue("k", Value::integer(1), "d").ok());
-  EXPECT_EQ(k(), Value::integer(1));
-  writeDomain("<dict><key>k</key><integer>2</integer></dict>", false);
-  EXPECT_EQ(k(), Value::integer(1));  // Not synchronized yet.
-  ASSERT_TRUE(Preferences::synchronize("d").ok());
-  EXPECT_EQ(k(), Value::integer(2));
-  // Same size, same inode, within the file system's clock tick.
-  writeDomain("<dict><key>k</key><integer>3</integer></dict>", true);
-  ASSERT_TRUE(Preferences::synchronize("d").ok());
-  EXPECT_EQ(k(), Value::integer(3));
-  std::filesystem::remove(root_ / directory_ + "/d.plist");
-  ASSERT_TRUE(Preferences::synchronize("d").ok());
-  EXPECT_EQ(k(), std::nullopt);
-}
-
 TEST_F(PreferencesTest, BrokenFilesReadAsNothingAndAreLoggedOncePerChange) {
   for (const std::string& body : {std::string("<dict><key>k</key>"), std::string("<array/>")}) {
     writeDomain(body, true);
@@ -92,32 +75,6 @@ TEST_F(PreferencesTest, InvalidDomainNamesAreRefused) {
   }
   EXPECT_TRUE(Preferences::setValue("k", Value::integer(1), "..a").ok());
   EXPECT_TRUE(std::filesystem::exists(root_ / directory_ + "/..a.plist"));
-}
-
-TEST_F(PreferencesTest, ConsentEntriesOfABundle) {
-  using Entries = std::vector<std::pair<std::string, std::optional<bool>>>;
-  auto entries = [](const std::string& bundle) -> std::optional<Entries> {
-    auto found = consent::ConsentStore::informationForBundle(bundle);
-    if (!found) return std::nullopt;
-    Entries pairs;
-    for (const auto& entry : *found) pairs.emplace_back(entry.service, entry.granted);
-    return pairs;
-  };
-  std::filesystem::create_directories(root_ / "var/db");
-  root_.write("var/db/consent.plist",
-              plist("<dict><key>a</key><array><dict><key>Service</key><string>s1</string>"
-                    "<key>Granted</key><true/></dict><string>x</string><dict><key>Granted</key>"
-                    "<true/></dict><dict><key>Service</key><integer>5</integer></dict>"
-                    "<dict><key>Service</key><string>s2</string><key>Granted</key>"
-                    "<string>yes</string></dict><dict><key>Service</key><string>s3</string>"
-                    "<key>Granted</key><false/></dict></array><key>b</key><string>x</string>"
-                    "</dict>"));
-  EXPECT_EQ(entries("a"), (Entries{{"s1", true}, {"s2", std::nullopt}, {"s3", false}}));
-  EXPECT_EQ(entries("b"), std::nullopt);  // Not an array.
-  for (const std::string& broken : {std::string("<dict>"), plist("<array/>")}) {
-    root_.write("var/db/consent.plist", broken);
-    EXPECT_EQ(entries("a"), std::nullopt) << broken;
-  }
 }
 
 }  // namespace

@@ -41,19 +41,6 @@ class SdkCacheTest : public ::testing::Test {
   std::string sdks_ = root_ / "System/Library/SDKs";
 };
 
-TEST_F(SdkCacheTest, ResolveMergesTheSdkThenFillsDefaults) {
-  writeSdk("System/Library/SDKs", "Proto");
-  Dictionary resolved = cache_.resolve(infoFor(Value::string("p")));
-  const Dictionary& plugIn = *resolved.find("QSExtension")->asDictionary();
-  EXPECT_EQ(*plugIn.find("QSExtensionProtocol"), Value::string("Proto"));
-  EXPECT_EQ(*plugIn.find("CleanTimeout"), Value::integer(5));
-  EXPECT_EQ(*plugIn.find("QSExtensionAttributes"),
-            Value::dictionary({{"QSExtensionVersion", Value::string("2.0")}}));
-  // A non-string extension point leaves the manifest as it is.
-  Dictionary info = infoFor(Value::integer(3));
-  EXPECT_EQ(cache_.resolve(info), info);
-}
-
 // Each way an SDK comes, changes or goes is seen at the next refresh, from a root that has no
 // SDK directory yet; a refresh with nothing changed keeps the generation and the dictionaries.
 TEST_F(SdkCacheTest, EveryChangeOfTheSdkDirectoryCountsAtTheNextRefresh) {

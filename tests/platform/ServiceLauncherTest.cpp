@@ -84,20 +84,6 @@ class ServiceLauncherTest : public ::testing::Test {
       {"ZynService", Value::dictionary({{"_SandboxProfile", Value::string("plugin")}})}};
 };
 
-TEST_F(ServiceLauncherTest, RemovalReachesEveryHostAndOnlyThatVersion) {
-  for (pid_t host : {getppid(), getpid()}) {
-    ASSERT_TRUE(ServiceLauncher::addService(host, "com.x.p", "1", executable_, description_).ok());
-  }
-  ASSERT_TRUE(
-      ServiceLauncher::addService(getpid(), "com.x.p", "2", executable_, description_).ok());
-  ASSERT_EQ(listed().size(), 3u);
-  EXPECT_EQ(ServiceLauncher::removeService("com.x.p", "1"), 0);
-  EXPECT_EQ(listed(), (decltype(listed()){{getpid(), "com.x.p", "2"}}));
-  EXPECT_EQ(ServiceLauncher::removeService("com.x.p", "1"), ServiceLauncher::kNoSuchService);
-  EXPECT_EQ(ServiceLauncher::removeService("com.x.p", "2"), 0);
-  EXPECT_TRUE(files().empty());
-}
-
 TEST_F(ServiceLauncherTest, BadRequestsFailAndWriteNothing) {
   pid_t child = fork();
   if (child == 0) _exit(0);

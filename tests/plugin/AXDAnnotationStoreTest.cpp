@@ -63,25 +63,6 @@ class AXDAnnotationStoreTest : public ::testing::Test {
   const std::string path_ = directory_ / "Annotations";
 };
 
-TEST_F(AXDAnnotationStoreTest, AMissingFileIsSilentAndTheFirstChangeWritesVersion16) {
-  auto tool = plugIn("tool");
-  LogCapture log;
-  AXDAnnotationStore store(path_.c_str());
-  EXPECT_TRUE(store.annotations().empty());
-  store.setAnnotation(Dictionary{{"election", I(1)}}, *tool);
-  EXPECT_EQ(log.text(), "");
-  EXPECT_EQ(file(), (Dictionary{{"version", I(16)},
-                                {"data", D({{"com.example.tool", D({{"election", I(1)}})}})}}));
-  EXPECT_EQ(contentsOf(path_).rfind("<?xml", 0), 0u);
-
-  struct stat st {};
-  ASSERT_EQ(stat(path_.c_str(), &st), 0);
-  mode_t mask = umask(022);
-  umask(mask);
-  EXPECT_EQ(st.st_mode & 0777, 0666 & ~mask);
-  EXPECT_EQ(std::distance(std::filesystem::directory_iterator(directory_.path()), {}), 1);
-}
-
 TEST_F(AXDAnnotationStoreTest, ARejectedFileIsResetAndOverwrittenAtTheFirstChange) {
   const std::string entry =
       "<key>com.example.old</key><dict><key>election</key><integer>1</integer></dict>";
@@ -131,27 +112,6 @@ TEST_F(AXDAnnotationStoreTest, ARejectedFileIsResetAndOverwrittenAtTheFirstChang
   }
 }
 
-TEST_F(AXDAnnotationStoreTest, AChangeKeepsWhatItDoesNotName) {
-  const Value extension = D({{"host", S("data")}});
-  auto tool = plugIn("tool");
-  auto other = plugIn("other");
-  {
-    AXDAnnotationStore store(path_.c_str());
-    store.setAnnotation(Dictionary{{"election", I(0)}, {"extension", extension}, {"tag", S("x")}},
-                        *tool);
-    store.setAnnotation(Dictionary{{"election", I(3)}}, *other);
-    store.setAnnotation(Dictionary{{"election", I(1)}}, *tool);
-  }
-  AXDAnnotationStore reloaded(path_.c_str());
-  EXPECT_EQ(reloaded.annotationForPlugIn(*tool),
-            (Dictionary{{"election", I(1)}, {"extension", extension}, {"tag", S("x")}}));
-
-  reloaded.setAnnotation(std::nullopt, *tool);
-  EXPECT_FALSE(reloaded.annotationForPlugIn(*tool));
-  EXPECT_EQ(file(), (Dictionary{{"version", I(16)},
-                                {"data", D({{"com.example.other", D({{"election", I(3)}})}})}}));
-}
-
 TEST_F(AXDAnnotationStoreTest, APlugInThatReplacesAnotherSharesItsEntry) {
   auto original = plugIn("tool");
   auto replacement = plugIn("newtool", "com.example.tool");
@@ -177,24 +137,6 @@ TEST_F(AXDAnnotationStoreTest, SavesIntoAMissingDirectoryFailAndCreateNothing) {
   EXPECT_EQ(log.text().find("unable to load"), std::string::npos);
   EXPECT_FALSE(std::filesystem::exists(directory_ / "missing"));
   EXPECT_EQ(store.annotationForPlugIn(*tool), std::nullopt) << "an unsaved change is undone";
-}
-
-TEST_F(AXDAnnotationStoreTest, TheDefaultFileLiesInAPrivateDirectoryOfTheUser) {
-  ScopedEnvironment environment;
-  environment.set("ANNEXA_ROOT", directory_.path());
-  const std::string annexa =
-      directory_ / ("var/users/" + std::to_string(geteuid()) + "/" + AXD_VENDOR_PREFIX + ".annexa");
-  AXDAnnotationStore store(nullptr);
-  EXPECT_EQ(store.annotationsURL(), annexa + "/Annotations");
-  struct stat st {};
-  ASSERT_EQ(stat(annexa.c_str(), &st), 0);
-  EXPECT_EQ(st.st_mode & 07777, 0700u);
-
-  directory_.write("blocked", "");
-  environment.set("ANNEXA_ROOT", directory_ / "blocked");
-  EXPECT_DEATH(
-      AXDAnnotationStore::defaultDatabaseURL(),
-      "unable to create plugin annotations directory:.*blocked/var/users.* error:.*Code=20");
 }
 
 // A writer killed at any moment leaves the old file or the new one: a fresh store always loads

@@ -52,14 +52,6 @@ class AXDPlugInFormTest : public DeviceRootTest {
   std::string app_;
 };
 
-TEST_F(AXDPlugInFormTest, AnAppExtensionSharesItsWholeBundleOnly) {
-  auto record = inApp("Tool.appex", A({S("Resources")}));
-  ASSERT_TRUE(record);
-  value::Dictionary extensions = extensionsOf(record->augmentForm(record->exportForm()));
-  ASSERT_EQ(extensions.size(), 1u);
-  EXPECT_EQ(grantedPath(extensions.find(".")), record->path());
-}
-
 TEST_F(AXDPlugInFormTest, SharedResourcesAreExtensionsInsideTheBundle) {
   value::Dictionary form{{"identifier", S(kIdentifier)}};
   EXPECT_EQ(inApp("Tool.bundle")->augmentForm(form), form);  // nothing shared, no "extensions"
@@ -123,15 +115,6 @@ TEST_F(AXDPlugInEntitlementTest, AnEntitlementIsHeldWhenPresentAndNotFalse) {
   EXPECT_FALSE(record->valueForEntitlement("absent"));
 }
 
-TEST_F(AXDPlugInEntitlementTest, TheAnnotationKeyIsTheReplacedPlugInWhenNamed) {
-  const std::string replace = std::string(AXD_VENDOR_PREFIX) + ".developer.replace-plugin";
-  EXPECT_EQ(withEntitlements({{replace, S("com.example.old")}})->annotationKey(),
-            "com.example.old");
-  EXPECT_EQ(withEntitlements({})->annotationKey(), kIdentifier);
-  EXPECT_EQ(withEntitlements({{replace, value::Value::boolean(true)}})->annotationKey(),
-            kIdentifier);
-}
-
 class AXDPlugInNameTest : public AXDPlugInEntitlementTest {
  protected:
   static std::shared_ptr<AXDPlugIn> named(std::optional<std::string> name,
@@ -143,18 +126,6 @@ class AXDPlugInNameTest : public AXDPlugInEntitlementTest {
     return build(fields);
   }
 };
-
-TEST_F(AXDPlugInNameTest, DisplayNamesComeFromTheRegistryUnlessSetFirst) {
-  value::Dictionary form = named("Tool", "T")->exportForm();
-  ASSERT_TRUE(form.find("localizedDisplayName"));
-  EXPECT_EQ(*form.find("localizedDisplayName"), S("Tool"));
-  auto preset = named("Tool", "T");
-  preset->setLocalizedName("Mine");  // before the first read, which must not overwrite it
-  EXPECT_EQ(preset->localizedName(), "Mine");
-  auto unnamed = named(std::nullopt, std::nullopt);
-  EXPECT_FALSE(unnamed->localizedName());
-  EXPECT_FALSE(unnamed->localizedShortName());
-}
 
 // The names are read from the registry at the first call; racing first calls must agree.
 TEST_F(AXDPlugInNameTest, ConcurrentFirstReadsAgree) {

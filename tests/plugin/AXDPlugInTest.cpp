@@ -32,25 +32,6 @@ class AXDPlugInTest : public ::testing::Test {
   ScopedEnvironment environment_;
 };
 
-TEST_F(AXDPlugInTest, TheRecordTakesItsFactsFromTheRegistry) {
-  PlugInRecord::Fields fields = plugIn(kSystemPath);
-  fields.originalIdentifier = "com.example.original";
-  // The raw Info.plist and the resolved plug-in dictionary differ, as after an SDK merge.
-  fields.infoDictionary = fields.infoDictionary.with("Raw", S("info"));
-  fields.plugInDictionary = fields.plugInDictionary.with("Resolved", S("sdk"));
-  auto record = build(fields);
-  ASSERT_TRUE(record);
-  EXPECT_EQ(record->originalIdentifier(), "com.example.original");
-  EXPECT_FALSE(record->containingUrl());
-  EXPECT_EQ(record->infoKey("Raw"), S("info"));
-  EXPECT_FALSE(record->infoKey("Resolved"));
-  EXPECT_EQ(record->pluginKey("Resolved"), S("sdk"));
-  EXPECT_EQ(record->attribute("QSExtensionVersion"), S("1.0"));
-  EXPECT_EQ(record->version(), "1.0");
-  EXPECT_EQ(record->protocolSpec(), S("ToolProtocol"));
-  EXPECT_FALSE(record->attribute("missing"));
-}
-
 TEST_F(AXDPlugInTest, HubProtocolVersionComesFromTheManifestElseFromItsStyle) {
   auto version = [](std::optional<value::Value> declared, bool legacy) {
     PlugInRecord::Fields fields = plugIn(kSystemPath);
@@ -79,16 +60,6 @@ TEST_F(AXDPlugInTest, RegistrationDateDropsTheFraction) {
   EXPECT_EQ(lastModified(1000.9), 1000);
   EXPECT_EQ(lastModified(-1.5), -1);
   EXPECT_EQ(lastModified(1e12), std::numeric_limits<std::int32_t>::max());
-}
-
-TEST_F(AXDPlugInTest, ANilUuidIsReplacedByARandomOne) {
-  PlugInRecord::Fields fields = plugIn(kSystemPath);
-  fields.uuid = value::Uuid();
-  auto first = build(fields);
-  auto second = build(fields);
-  ASSERT_TRUE(first && second);
-  EXPECT_NE(first->uuid(), value::Uuid());
-  EXPECT_FALSE(first->isEqual(*second));
 }
 
 TEST_F(AXDPlugInTest, NoBundleLocationOrIdentifierGivesNoRecord) {

@@ -45,26 +45,6 @@ class SandboxExtensionTest : public DeviceRootTest {
   std::string file_;
 };
 
-TEST_F(SandboxExtensionTest, IssueConsumeReleaseRoundTrip) {
-  std::string token = issue(file_);
-  EXPECT_EQ(token.rfind(std::string("v1;") + sandbox::kReadExtensionClass + ";", 0), 0u) << token;
-
-  std::size_t held = GrantTable::shared().size();
-  os::Result<std::int64_t> handle = Sandbox::consume(token);
-  ASSERT_TRUE(handle.ok()) << handle.error().message;
-  EXPECT_GT(handle.value(), 0);
-  ASSERT_TRUE(GrantTable::shared().find(handle.value()));
-  EXPECT_EQ(GrantTable::shared().find(handle.value())->path(), canonical(file_));
-  EXPECT_EQ(GrantTable::shared().find(handle.value())->extensionClass(),
-            sandbox::kReadExtensionClass);
-  EXPECT_EQ(GrantTable::shared().size(), held + 1);
-
-  EXPECT_TRUE(Sandbox::release(handle.value()).ok());
-  EXPECT_EQ(GrantTable::shared().size(), held);
-  EXPECT_EQ(Sandbox::release(handle.value()).error().errnum, EBADF);
-  EXPECT_EQ(Sandbox::release(0).error().errnum, EBADF);
-}
-
 TEST_F(SandboxExtensionTest, ATokenNamesTheCanonicalPathUnlessAskedToTakeItAsGiven) {
   directory("dir/sub");
   std::filesystem::create_symlink(file_, root_ / "link");
