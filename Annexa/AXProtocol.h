@@ -3,6 +3,7 @@
 // The daemon's wire protocol in one place: the request envelope, the field names, the versions,
 // the flags and the error codes. Both ends use these names; docs/wire-protocol.md describes them.
 
+#include <cstddef>
 #include <cstdint>
 
 #include "platform/value/Value.h"
@@ -48,6 +49,10 @@ inline constexpr std::uint64_t AXDiscoverAll = 0x200;
 // Hold flags: the whole value selects the mode.
 inline constexpr std::uint64_t kHoldApplications = 1;
 inline constexpr std::uint64_t kHoldPlugIns = 2;
+
+// The most elements one request's "paths" or "uuids" may hold: a longer list is refused with
+// code 4, so that one request cannot hold every other client's work for long.
+inline constexpr std::size_t kMaxListLength = 4096;
 
 // Error codes of the "Annexa" domain.
 enum Code : std::int64_t {

@@ -110,7 +110,8 @@ class Transaction {
   // An integer field of the request; 0 when absent or not an unsigned integer.
   std::uint64_t integerField(const char* key) const;
   // Visits the elements of the array |key| in order until |visit| returns false. Fails with
-  // code 4 and |invalid| when |key| is absent or not an array.
+  // code 4 and |invalid| when |key| is absent or not an array, and with code 4 when it holds more
+  // than AXProtocol::kMaxListLength elements (nothing visited).
   bool walkArray(const char* key, const char* invalid,
                  const std::function<bool(const value::Value&)>& visit);
   // One element of "paths": false (failure sent) when it is not an absolute path string.

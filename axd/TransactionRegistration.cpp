@@ -58,6 +58,12 @@ bool Transaction::walkArray(const char* key, const char* invalid,
     fail(AXProtocol::kMalformedRequest, invalid);
     return false;
   }
+  if (elements->size() > AXProtocol::kMaxListLength) {
+    fail(AXProtocol::kMalformedRequest,
+         os::format("invalid request format (%u elements in \"%s\", at most %u)",
+                    {elements->size(), key, AXProtocol::kMaxListLength}));
+    return false;
+  }
   for (const value::Value& element : *elements) {
     if (!visit(element)) return false;
   }

@@ -45,9 +45,21 @@ const Sink& sink() {
   return *kSink;
 }
 
+// |message| cut to kMaxLine bytes, never inside a UTF-8 sequence, with the count of what was cut.
+std::string_view bounded(std::string_view message, std::string& storage) {
+  if (message.size() <= Log::kMaxLine) return message;
+  std::size_t end = Log::kMaxLine;
+  while (end > 0 && (static_cast<unsigned char>(message[end]) & 0xC0) == 0x80) --end;
+  storage.assign(message.substr(0, end));
+  storage += "... (" + std::to_string(message.size() - end) + " bytes cut)";
+  return storage;
+}
+
 }  // namespace
 
-void Log::write(int level, std::string_view message) {
+void Log::write(int level, std::string_view whole) {
+  std::string storage;
+  std::string_view message = bounded(whole, storage);
   const Sink& s = sink();
   if (syslogListens()) syslog(level, "%.*s", static_cast<int>(message.size()), message.data());
   if (!s.toStderr) return;

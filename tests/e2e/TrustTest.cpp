@@ -2,6 +2,7 @@
 // as bad luck would: through the real daemon, with clients that misbehave or die at the worst
 // moment.
 
+#include <algorithm>
 #include <chrono>
 #include <filesystem>
 #include <string>
@@ -105,6 +106,31 @@ TEST_F(TrustTest, APathWithANulByteOrALinkedEntitlementFileIsRefused) {
   auto request = linked.client().request(AXProtocol::kMatch);
   request[AXProtocol::kFlags] = Value::unsignedInteger(AXProtocol::AXDiscoverAll);
   EXPECT_EQ(linked.outcome(request), "11: unauthorized discovery flag (AXDiscoverAll)");
+}
+
+// What one client may cost the others: lists are bounded, and an oversized message costs one
+// line of the log, not its size.
+TEST_F(TrustTest, OneRequestCannotHoldTheDaemonOrFloodItsLog) {
+  ASSERT_TRUE(start());
+  std::vector<value::Uuid> many(AXProtocol::kMaxListLength + 1, value::Uuid::random());
+  EXPECT_EQ(send(AXProtocol::kAccess, many),
+            "4: invalid request format (4097 elements in \"uuids\", at most 4096)");
+  many.pop_back();
+  EXPECT_EQ(send(AXProtocol::kAccess, many), "4: no such plugin (uuid not found)");
+
+  std::unique_ptr<RawClient> raw = connectRaw();
+  ASSERT_TRUE(raw);
+  ASSERT_TRUE(raw->sendFrame(zyn::FrameKind::OneWay, 1, Value::string(std::string(1 << 20, 'x'))));
+  ASSERT_TRUE(daemon().waitForLog("bytes cut)"));
+  expectServing();
+  std::size_t longest = 0;
+  std::string log = daemon().log();
+  for (std::size_t start = 0, end; start < log.size(); start = end + 1) {
+    end = log.find('\n', start);
+    if (end == std::string::npos) end = log.size();
+    longest = std::max(longest, end - start);
+  }
+  EXPECT_LT(longest, 9000u);
 }
 
 }  // namespace
