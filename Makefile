@@ -46,12 +46,19 @@ bench: bootstrap
 	cmake --build $(BENCH_BUILD) -j $(JOBS)
 	scripts/bench $(BENCH_BUILD)
 
+# Each target runs for FUZZ_SECONDS from its committed seeds; new inputs it finds stay in
+# $(FUZZ_BUILD)/corpus/<directory>. `make test` replays the committed seeds (docs/fuzzing.md).
+FUZZ_TARGETS = FrameDecoderFuzz:frame PropertyListFuzz:plist CborCodecFuzz:cbor
+
 fuzz:
 	@scripts/bootstrap --fuzz
 	CC=clang CXX=clang++ cmake -S . -B $(FUZZ_BUILD) -DCMAKE_BUILD_TYPE=RelWithDebInfo -DAXD_FUZZ=ON >/dev/null
-	cmake --build $(FUZZ_BUILD) -j $(JOBS) --target FrameDecoderFuzz
-	mkdir -p $(FUZZ_BUILD)/corpus && cp -n fuzz/corpus/frame/* $(FUZZ_BUILD)/corpus/ 2>/dev/null || true
-	$(FUZZ_BUILD)/fuzz/FrameDecoderFuzz -max_total_time=$(FUZZ_SECONDS) $(FUZZ_BUILD)/corpus
+	cmake --build $(FUZZ_BUILD) -j $(JOBS) --target $(foreach t,$(FUZZ_TARGETS),$(word 1,$(subst :, ,$(t))))
+	for entry in $(FUZZ_TARGETS); do \
+	  target=$${entry%%:*}; corpus=$(FUZZ_BUILD)/corpus/$${entry##*:}; mkdir -p $$corpus && \
+	  $(FUZZ_BUILD)/fuzz/$$target -max_total_time=$(FUZZ_SECONDS) $$corpus fuzz/corpus/$${entry##*:} \
+	    || exit 1; \
+	done
 
 format:
 	git ls-files '*.h' '*.cpp' | xargs clang-format -i

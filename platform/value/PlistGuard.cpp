@@ -25,6 +25,12 @@ struct Binary {
     bool container = false;
     std::size_t firstRef = 0;
     std::uint64_t refs = 0;
+    std::uint64_t keys = 0;  // A dictionary's first |keys| references are its keys.
+  };
+  struct Sized {
+    int type;
+    std::size_t at;  // The first byte after the marker and its count.
+    std::uint64_t count;
   };
 
   std::span<const std::uint8_t> bytes;
@@ -42,13 +48,12 @@ struct Binary {
     return number(object.firstRef + i * refSize, refSize);
   }
 
-  // The references of object |index|; nothing when its bytes lie outside the object area.
-  std::optional<Object> object(std::uint64_t index) const {
+  // Where object |index| starts, and the item count its marker gives (the count of a string,
+  // array or dictionary); nothing when its bytes lie outside the object area.
+  std::optional<Sized> sized(std::uint64_t index) const {
     std::uint64_t offset = number(table + index * offsetSize, offsetSize);
     if (offset < 8 || offset >= table) return std::nullopt;
     std::uint8_t marker = bytes[offset];
-    int type = marker >> 4;
-    if (type != 0xA && type != 0xC && type != 0xD) return Object{};
     std::size_t at = offset + 1;
     std::uint64_t n = marker & 0xF;
     if (n == 0xF) {  // The count follows as an integer object of 1, 2, 4 or 8 bytes.
@@ -58,9 +63,43 @@ struct Binary {
       n = number(at + 1, width);
       at += 1 + width;
     }
-    std::uint64_t perEntry = type == 0xD ? 2 : 1;  // A dictionary lists its keys, then its values.
-    if (n > (table - at) / refSize / perEntry) return std::nullopt;
-    return Object{true, at, n * perEntry};
+    return Sized{marker >> 4, at, n};
+  }
+
+  // The references of object |index|; nothing when its bytes lie outside the object area.
+  std::optional<Object> object(std::uint64_t index) const {
+    auto item = sized(index);
+    if (!item) return std::nullopt;
+    if (item->type != 0xA && item->type != 0xC && item->type != 0xD) return Object{};
+    std::uint64_t perEntry = item->type == 0xD ? 2 : 1;  // A dictionary: its keys, its values.
+    if (item->count > (table - item->at) / refSize / perEntry) return std::nullopt;
+    return Object{true, item->at, item->count * perEntry, item->type == 0xD ? item->count : 0};
+  }
+
+  // Whether object |index| is a string without NUL. libplist asserts that a key's length
+  // matches strlen() when the key is read back, so a NUL inside a key would end the process.
+  bool isKey(std::uint64_t index) const {
+    if (index >= count) return false;
+    auto key = sized(index);
+    if (!key || (key->type != 0x5 && key->type != 0x6)) return false;
+    std::size_t unit = key->type == 0x6 ? 2 : 1;  // ASCII bytes or UTF-16 code units.
+    if (key->count > (table - key->at) / unit) return false;
+    for (std::uint64_t i = 0; i < key->count; ++i) {
+      if (number(key->at + i * unit, unit) == 0) return false;
+    }
+    return true;
+  }
+
+  // Whether every key of dictionary |object| is a string without NUL. |known| marks the objects
+  // found to be keys so far, so that a long key shared by many entries is read once.
+  bool keysValid(const Object& object, std::vector<bool>& known) const {
+    for (std::uint64_t i = 0; i < object.keys; ++i) {
+      std::uint64_t key = reference(object, i);
+      if (key < count && known[key]) continue;
+      if (!isKey(key)) return false;
+      known[key] = true;
+    }
+    return true;
   }
 };
 
@@ -191,13 +230,17 @@ os::Status PlistGuard::checkBinary(std::span<const std::uint8_t> bytes, std::siz
   std::vector<std::uint64_t> nodes(plist->count, 1);
   std::vector<std::size_t> depth(plist->count, 0);
   std::vector<Visit> stack;
-  // Measures object |index| when it is a leaf, or opens it; false when it cannot be read.
-  auto enter = [&](std::uint64_t index) {
+  std::vector<bool> keys(plist->count, false);
+  // Measures object |index| when it is a leaf, or opens it; fails when it cannot be read.
+  auto enter = [&](std::uint64_t index) -> os::Status {
     auto object = plist->object(index);
-    if (!object) return false;
+    if (!object) return invalid("binary property list has an object out of range");
+    if (!plist->keysValid(*object, keys)) {
+      return invalid("binary property list has a key that is not a string or holds NUL");
+    }
     state[index] = object->container ? kOpen : kDone;
     if (object->container) stack.push_back(Visit{index, *object});
-    return true;
+    return os::success();
   };
   // Adds measured object |index| to the innermost open container.
   auto fold = [&](std::uint64_t index) {
@@ -205,7 +248,7 @@ os::Status PlistGuard::checkBinary(std::span<const std::uint8_t> bytes, std::siz
     parent.nodes = std::min<std::uint64_t>(parent.nodes + nodes[index], maxNodes + 1);
     parent.depth = std::max(parent.depth, depth[index]);
   };
-  if (!enter(plist->top)) return invalid("binary property list has an object out of range");
+  if (os::Status top = enter(plist->top); !top.ok()) return top;
   while (!stack.empty()) {
     if (stack.size() > maxDepth) {
       return invalid(os::format("property list nests deeper than %u", {maxDepth}));
@@ -222,8 +265,8 @@ os::Status PlistGuard::checkBinary(std::span<const std::uint8_t> bytes, std::siz
     std::uint64_t child = plist->reference(visit.object, stack.back().next++);
     if (child >= plist->count) return invalid("binary property list refers past its objects");
     if (state[child] == kOpen) return invalid("binary property list contains a reference cycle");
-    if (state[child] == kNew && !enter(child)) {
-      return invalid("binary property list has an object out of range");
+    if (state[child] == kNew) {
+      if (os::Status entered = enter(child); !entered.ok()) return entered;
     }
     if (state[child] == kDone) fold(child);
   }

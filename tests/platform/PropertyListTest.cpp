@@ -2,6 +2,7 @@
 #include <plist/plist.h>
 
 #include <cerrno>
+#include <filesystem>
 #include <string>
 
 #include "platform/value/PropertyList.h"
@@ -183,6 +184,40 @@ TEST(PropertyListTest, SharedObjectsCannotExpandWithoutBound) {
   objects.push_back({0x51, 'x'});
   EXPECT_NE(PropertyList::read(binaryPlist(objects)).error().message.find("expands"),
             std::string::npos);
+}
+
+// libplist asserts, ending the process, when it hands back a key holding NUL; a dictionary's key
+// must also be a string. Each crash-* file in the fuzz corpus once ended the process.
+TEST(PropertyListTest, KeysLibplistCannotHoldAreRefused) {
+  auto dictOf = [](std::uint32_t key, std::uint32_t value) {
+    std::vector<std::uint8_t> object = arrayOf({key, value});
+    object[0] = 0xD1;
+    return object;
+  };
+  const std::vector<std::uint8_t> keys[] = {
+      {0x53, 'a', 0, 'b'},           // ASCII
+      {0x62, 0, 0xE9, 0, 0},         // UTF-16
+      {0x5F, 0x10, 3, 'a', 'b', 0},  // a longer count, given as an integer
+      {0x10, 7},                     // an integer
+  };
+  for (const auto& key : keys) {
+    EXPECT_EQ(errnumOf(PropertyList::read(binaryPlist({dictOf(1, 2), key, {0x09}}))), EINVAL);
+    EXPECT_EQ(errnumOf(PropertyList::read(binaryPlist({arrayOf({1}), dictOf(2, 3), key, {0x09}}))),
+              EINVAL);
+  }
+  EXPECT_TRUE(
+      PropertyList::read(binaryPlist({dictOf(1, 2), {0x62, 0, 0xE9, 0, 'x'}, {0x09}})).ok());
+  for (const char* key : {"a&#0;b", "a&#x0;b"}) {
+    std::string xml = xmlPlist("<dict><key>" + std::string(key) + "</key><true/></dict>");
+    EXPECT_EQ(errnumOf(PropertyList::read(bytesOf(xml))), EINVAL) << key;
+  }
+  std::size_t crashes = 0;
+  for (const auto& entry : std::filesystem::directory_iterator(AXD_PLIST_CORPUS)) {
+    if (!entry.path().filename().string().starts_with("crash-")) continue;
+    ++crashes;
+    EXPECT_EQ(errnumOf(PropertyList::readFile(entry.path())), EINVAL) << entry.path();
+  }
+  EXPECT_GT(crashes, 0u);
 }
 
 // A malformed file names its path in the error, as WorkspaceTest sees with a broken Info.plist.
