@@ -117,6 +117,7 @@ std::optional<AXError> AXDPlugIn::enableForPid(pid_t pid) const {
   if (added.ok()) return std::nullopt;
   os::Log::notice("zyn error %d allowing pid %d to use plug-in %@(%@) %@ at %@",
                   {added.error().errnum, pid, id, version, uuidText, path()});
+  os::Log::notice("service launcher: %@", {added.error().message});
   return AXMakeErrorWithFormat(kEnableFailed, "unable to enable plug-in %@(%@) for pid %d",
                                {id, uuidText, pid});
 }

@@ -231,7 +231,7 @@ os::Status ServiceLauncher::addService(pid_t host, const std::string& bundleIden
   if (!valid.ok()) return valid;
   os::Result<std::string> xml = ServiceFile::encode({executablePath, description, started.value()});
   if (!xml.ok()) return xml.error();
-  os::Status made = os::Paths::ensureDirectory(tableDir(), 0700);
+  os::Status made = os::Paths::ensureRuntimeDirectory(tableDir(), 0700);
   if (!made.ok()) return made;
   os::Result<TableLock> lock = TableLock::acquire(tableDir(), TableLock::Mode::Shared);
   if (!lock.ok()) return lock.error();

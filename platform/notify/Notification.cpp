@@ -83,7 +83,8 @@ os::Status Notification::post(const std::string& name) {
   os::Result<std::string> made = makeDirectory();
   if (!made.ok()) return made.error();
   std::string file = made.value() + "/" + name;
-  int fd = open(file.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, kFileMode);
+  // Never through a link: another process could point one at a file of this user's.
+  int fd = open(file.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, kFileMode);
   if (fd < 0) return os::Error::fromErrno("open " + file);
   os::Status incremented = increment(fd, file);
   // The close is what wakes the watchers (IN_CLOSE_WRITE), after the lock is gone.
@@ -107,7 +108,7 @@ std::string Notification::directory() {
 
 os::Result<std::string> Notification::makeDirectory() {
   std::string made = directory();
-  os::Status status = os::Paths::ensureDirectory(made, kDirectoryMode);
+  os::Status status = os::Paths::ensureRuntimeDirectory(made, kDirectoryMode);
   if (!status.ok()) return status.error();
   return made;
 }
@@ -119,7 +120,7 @@ os::Status Notification::validate(const std::string& name) {
 }
 
 os::Result<std::uint64_t> Notification::countAt(const std::string& file) {
-  int fd = open(file.c_str(), O_RDONLY | O_CLOEXEC);
+  int fd = open(file.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW);
   if (fd < 0 && errno == ENOENT) return std::uint64_t{0};
   if (fd < 0) return os::Error::fromErrno("open " + file);
   os::Result<std::uint64_t> counter =

@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdio>
 #include <cstdlib>
 #include <memory>
 #include <optional>
@@ -123,6 +124,29 @@ Status Paths::ensurePrivateDirectory(const std::string& path) {
   int fd = open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
   if (fd < 0) return Error::fromErrno("open " + path);
   Status status = fchmod(fd, 0700) == 0 ? success() : Error::fromErrno("chmod " + path);
+  close(fd);
+  return status;
+}
+
+Status Paths::ensureRuntimeDirectory(const std::string& path, mode_t mode) {
+  std::size_t slash = path.find_last_of('/');
+  if (slash != std::string::npos && slash > 0) {
+    Status parent = ensureDirectory(path.substr(0, slash), 0755);
+    if (!parent.ok()) return parent;
+  }
+  bool made = mkdir(path.c_str(), mode) == 0;
+  if (!made && errno != EEXIST) return Error::fromErrno("mkdir " + path);
+  int fd = open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
+  if (fd < 0) return Error::fromErrno("open " + path);
+  struct stat st {};
+  Status status = fstat(fd, &st) == 0 ? success() : Error::fromErrno("stat " + path);
+  if (status.ok() && made && fchmod(fd, mode) != 0) status = Error::fromErrno("chmod " + path);
+  if (status.ok() && !made && (st.st_uid != geteuid() || (st.st_mode & 07777) != mode)) {
+    char found[96];
+    std::snprintf(found, sizeof found, "owned by uid %u with mode %04o, not uid %u with %04o",
+                  st.st_uid, st.st_mode & 07777, geteuid(), mode);
+    status = Error{EPERM, path + " is " + found + ": refusing to use it"};
+  }
   close(fd);
   return status;
 }

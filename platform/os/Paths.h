@@ -49,6 +49,13 @@ class Paths {
   // parents (as ensureDirectory, mode 0700) and sets its mode to 0700. A symbolic link at
   // |path| is refused (ELOOP), never followed: the directory may be another process's to change.
   static Status ensurePrivateDirectory(const std::string& path);
+  // Makes sure |path| is a directory of this process's effective user with exactly |mode|, as the
+  // runtime directories must be: another user who could write in one could replace what the
+  // daemon puts there. Creates it (and missing parents, as ensureDirectory) with |mode| exactly,
+  // whatever the umask. An existing one is used only when it is a directory, not a symbolic link,
+  // owned by this user and of exactly |mode|; otherwise EPERM, with a message that names what is
+  // wrong, and nothing is changed.
+  static Status ensureRuntimeDirectory(const std::string& path, mode_t mode);
 };
 
 }  // namespace os

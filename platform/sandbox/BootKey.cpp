@@ -101,7 +101,7 @@ os::Result<std::string> replaceKey(const std::string& bootId) {
 // The slow path: under the creation lock, read again (another process may have just made the
 // key) and make a new key only when there is still none to use.
 os::Result<std::string> loadLocked(const std::string& bootId) {
-  os::Status made = os::Paths::ensureDirectory(directory(), 0700);
+  os::Status made = os::Paths::ensureRuntimeDirectory(directory(), 0700);
   if (!made.ok()) return made.error();
   std::string lockPath = directory() + "/key.lock";
   FileDescriptor lock(open(lockPath.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));

@@ -11,6 +11,7 @@
 
 #include "Annexa/AXProtocol.h"
 #include "platform/registrum/Workspace.h"
+#include "platform/value/PropertyList.h"
 #include "tests/e2e/Bundles.h"
 #include "tests/e2e/DaemonTest.h"
 
@@ -131,6 +132,33 @@ TEST_F(TrustTest, OneRequestCannotHoldTheDaemonOrFloodItsLog) {
     longest = std::max(longest, end - start);
   }
   EXPECT_LT(longest, 9000u);
+}
+
+// What another local user may have put into the runtime directory is never used: a link where a
+// notification belongs is not written through, and a directory others may write is refused.
+TEST_F(TrustTest, PlantedRuntimeFilesAreNotUsed) {
+  ASSERT_TRUE(start());
+  std::string plugIn = inApp("Planted", {.id = "planted.tool", .executable = "/bin/sleep"});
+  ASSERT_EQ(send(AXProtocol::kAdd, {plugIn}), "ok");
+  std::string victim = root() + "/victim";
+  bundles::writePlist(victim, Value::string("precious"));
+  std::string notify = root() + "/run/notify";
+  std::filesystem::create_directories(notify);
+  std::filesystem::permissions(notify, std::filesystem::perms(0755));
+  std::filesystem::create_symlink(victim,
+                                  notify + "/" AXD_VENDOR_PREFIX ".annexa.annotation-change");
+
+  auto annotate = client().client().request(AXProtocol::kAnnotate, {uuid(plugIn)}, 0);
+  annotate[AXProtocol::kAnnotations] = Value::dictionary({{"election", Value::integer(1)}});
+  EXPECT_EQ(client().outcome(annotate), "ok");
+  EXPECT_EQ(value::PropertyList::readFile(victim).value(), Value::string("precious"));
+  EXPECT_GE(logCount("unable to post"), 1u);
+
+  std::string launcher = root() + "/run/launcher";
+  std::filesystem::create_directories(launcher);
+  std::filesystem::permissions(launcher, std::filesystem::perms(0777));
+  EXPECT_EQ(send(AXProtocol::kReady, {uuid(plugIn)}).rfind("4: unable to enable plug-in", 0), 0u);
+  EXPECT_EQ(logCount("refusing to use it"), 1u);
 }
 
 }  // namespace

@@ -47,6 +47,7 @@ class BootKeyTest : public DeviceRootTest {
   // Writes a key file with |text| and |mode| in place of the current one.
   void plant(const std::string& text, mode_t mode) {
     directory("run/sandbox");
+    chmod((root_ / "run/sandbox").c_str(), 0700);  // as the key's directory must be
     std::ofstream(BootKey::path(), std::ios::trunc) << text;
     chmod(BootKey::path().c_str(), mode);
   }
