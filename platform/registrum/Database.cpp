@@ -1,7 +1,5 @@
 #include "platform/registrum/Database.h"
 
-#include <cerrno>
-
 namespace registrum {
 
 os::Result<std::unique_ptr<Database>> Database::open(const std::string& path) {
@@ -46,7 +44,9 @@ os::Status Database::execute(const std::string& sql) {
   if (rc == SQLITE_OK) return os::success();
   std::string text = message ? message : sqlite3_errstr(rc);
   sqlite3_free(message);
-  int errnum = (rc == SQLITE_BUSY || rc == SQLITE_LOCKED) ? EBUSY : EIO;
+  int errnum = EIO;
+  if (rc == SQLITE_BUSY || rc == SQLITE_LOCKED) errnum = EBUSY;
+  if (rc == SQLITE_NOTADB || rc == SQLITE_CORRUPT) errnum = kNotADatabase;
   return os::Error{errnum, "registry database: " + text};
 }
 
@@ -66,7 +66,9 @@ void Database::releaseMemory() {
 }
 
 os::Error Database::error(const std::string& what) const {
-  return os::Error{EIO, "registry database: " + what + ": " + sqlite3_errmsg(db_)};
+  int rc = sqlite3_errcode(db_);
+  int errnum = (rc == SQLITE_NOTADB || rc == SQLITE_CORRUPT) ? kNotADatabase : EIO;
+  return os::Error{errnum, "registry database: " + what + ": " + sqlite3_errmsg(db_)};
 }
 
 }  // namespace registrum

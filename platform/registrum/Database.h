@@ -2,6 +2,7 @@
 
 #include <sqlite3.h>
 
+#include <cerrno>
 #include <functional>
 #include <map>
 #include <memory>
@@ -19,9 +20,12 @@ class Database {
  public:
   // How long a statement waits for another connection's write lock before failing with EBUSY.
   static constexpr int kBusyTimeoutMs = 10000;
+  // The errnum of a failure because the file is no SQLite database, or a damaged one.
+  static constexpr int kNotADatabase = EBADMSG;
 
   // Opens (creating when missing) the database file at |path| and switches it to WAL mode.
-  // Fails with EIO and SQLite's message, or ENOENT/EACCES-like errors of the file.
+  // Fails with kNotADatabase for a file that is no (intact) SQLite database, EIO and SQLite's
+  // message, or ENOENT/EACCES-like errors of the file.
   static os::Result<std::unique_ptr<Database>> open(const std::string& path);
 
   ~Database();
@@ -31,7 +35,8 @@ class Database {
   // The statement for |sql|, prepared once and then reused. Fails with EIO for bad SQL.
   os::Result<Statement> prepare(const std::string& sql);
 
-  // Runs |sql| (several statements allowed) without results.
+  // Runs |sql| (several statements allowed) without results. Fails with EBUSY when the database
+  // stayed locked, kNotADatabase when it is damaged, EIO otherwise.
   os::Status execute(const std::string& sql);
 
   // Runs |body| inside BEGIN IMMEDIATE ... COMMIT; rolls back when |body| or the commit fails

@@ -69,14 +69,31 @@ os::Status checkVersion(Database& db) {
   std::int64_t version = select.value().integer(0);
   if (version == Schema::kVersion) return os::success();
   if (version >= 1 && version < Schema::kVersion) return migrate(db, version);
-  return os::Error{EIO, "registry database has schema version " + std::to_string(version) +
-                            ", this program reads version " + std::to_string(Schema::kVersion)};
+  return os::Error{Database::kNotADatabase,
+                   "registry database has schema version " + std::to_string(version) +
+                       ", this program reads version " + std::to_string(Schema::kVersion)};
+}
+
+// Whether the database holds tables but no schema version of ours: another program's file.
+os::Result<bool> isForeign(Database& db) {
+  os::Result<Statement> select = db.prepare(
+      "SELECT (SELECT COUNT(*) FROM sqlite_master) > 0 AND "
+      "(SELECT COUNT(*) FROM sqlite_master WHERE type = 'table' AND name = 'schema_version') = 0");
+  if (!select.ok()) return select.error();
+  os::Result<bool> row = select.value().step();
+  if (!row.ok()) return row.error();
+  return select.value().integer(0) != 0;
 }
 
 }  // namespace
 
 os::Status Schema::ensure(Database& db) {
   return db.transaction([&]() -> os::Status {
+    os::Result<bool> foreign = isForeign(db);
+    if (!foreign.ok()) return foreign.error();
+    if (foreign.value()) {
+      return os::Error{Database::kNotADatabase, "registry database holds another program's tables"};
+    }
     os::Status created = db.execute(kTables);
     if (!created.ok()) return created;
     return checkVersion(db);

@@ -16,7 +16,8 @@ class Schema {
 
   // Creates the tables in |db| when they are missing and brings a database of an earlier version
   // to this one, in one transaction, so that processes opening a database at once agree. Fails
-  // with EIO for a database of a later (or unknown) version.
+  // with Database::kNotADatabase for a database of a later (or unknown) version, or one that
+  // holds tables but no schema version (another program's).
   static os::Status ensure(Database& db);
 };
 

@@ -1,7 +1,12 @@
 #include "platform/registrum/Store.h"
 
-#include <cerrno>
+#include <sys/stat.h>
 
+#include <cerrno>
+#include <cstdio>
+#include <ctime>
+
+#include "platform/os/Log.h"
 #include "platform/registrum/RecordCodec.h"
 #include "platform/registrum/RecordFields.h"
 #include "platform/registrum/Schema.h"
@@ -18,9 +23,49 @@ constexpr const char* kPlugInSelect =
     "FROM plugins p LEFT JOIN applications a ON a.path = p.application_path ";
 constexpr int kApplicationColumn = 7;
 
+constexpr const char* kKeySelect = "SELECT uuid, path, data_container FROM plugins ";
+
+constexpr int kLogWarning = 4;
+
 constexpr const char* kApplicationSelect =
     "SELECT path, bundle_identifier, bundle_version, localized_name, placeholder "
     "FROM applications ";
+
+os::Result<std::unique_ptr<Database>> openWithSchema(const std::string& path) {
+  os::Result<std::unique_ptr<Database>> db = Database::open(path);
+  if (!db.ok()) return db.error();
+  os::Status schema = Schema::ensure(*db.value());
+  if (!schema.ok()) return schema.error();
+  return db;
+}
+
+bool sameFile(const std::string& path, const struct stat& seen) {
+  struct stat now {};
+  return ::stat(path.c_str(), &now) == 0 && now.st_dev == seen.st_dev && now.st_ino == seen.st_ino;
+}
+
+// Renames the database at |path|, with its -wal and -shm and |keptWith|, to
+// "<name>.damaged-<seconds>" when it is still the file |seen|; another process may have set it
+// aside and started afresh already.
+os::Status setAside(const std::string& path, const struct stat& seen,
+                    const std::vector<std::string>& keptWith, const os::Error& why) {
+  if (!sameFile(path, seen)) return os::success();
+  std::string suffix = ".damaged-" + std::to_string(std::time(nullptr));
+  std::vector<std::string> parts{path, path + "-wal", path + "-shm"};
+  parts.insert(parts.end(), keptWith.begin(), keptWith.end());
+  std::string kept;
+  for (const std::string& part : parts) {
+    if (::rename(part.c_str(), (part + suffix).c_str()) == 0) {
+      kept += (kept.empty() ? "" : ", ") + part + suffix;
+    } else if (errno != ENOENT) {
+      return os::Error::fromErrno("cannot set the damaged registry database " + part + " aside");
+    }
+  }
+  os::Log::write(kLogWarning, why.message + "; kept it as " + kept +
+                                  " and started an empty registry: install the applications and "
+                                  "register the plug-ins again");
+  return os::success();
+}
 
 os::Error corrupt(const std::string& what, const os::Error& cause) {
   return os::Error{EIO, "registry database: " + what + ": " + cause.message};
@@ -29,11 +74,18 @@ os::Error corrupt(const std::string& what, const os::Error& cause) {
 }  // namespace
 
 os::Result<std::unique_ptr<Store>> Store::open(const std::string& path,
-                                               std::shared_ptr<sdk::SdkCache> sdks) {
-  os::Result<std::unique_ptr<Database>> db = Database::open(path);
+                                               std::shared_ptr<sdk::SdkCache> sdks,
+                                               const std::vector<std::string>& keptWith) {
+  struct stat seen {};
+  bool existed = ::stat(path.c_str(), &seen) == 0;
+  os::Result<std::unique_ptr<Database>> db = openWithSchema(path);
+  // Keep the file for whoever wants to look at it, but do not stay unable to start over it.
+  if (!db.ok() && db.error().errnum == Database::kNotADatabase && existed) {
+    os::Status setAsideStatus = setAside(path, seen, keptWith, db.error());
+    if (!setAsideStatus.ok()) return setAsideStatus.error();
+    db = openWithSchema(path);
+  }
   if (!db.ok()) return db.error();
-  os::Status schema = Schema::ensure(*db.value());
-  if (!schema.ok()) return schema.error();
   return std::unique_ptr<Store>(new Store(std::move(db.value()), std::move(sdks)));
 }
 
@@ -127,10 +179,48 @@ os::Status Store::putPlugIn(const PlugInRecord::Fields& fields) {
       .run();
 }
 
-os::Status Store::deletePlugIn(const value::Uuid& uuid) {
-  os::Result<Statement> remove = db_->prepare("DELETE FROM plugins WHERE uuid = ?");
+os::Result<std::vector<Store::PlugInKey>> Store::damagedPlugIns() {
+  os::Result<Statement> select = db_->prepare(std::string(kPlugInSelect) + "ORDER BY p.path");
+  if (!select.ok()) return select.error();
+  std::uint64_t sdkGeneration = sdks_->refresh();
+  std::vector<PlugInKey> damaged;
+  for (;;) {
+    os::Result<bool> row = select.value().step();
+    if (!row.ok()) return row.error();
+    if (!row.value()) return damaged;
+    if (plugInRow(select.value(), sdkGeneration).ok()) continue;
+    damaged.push_back(
+        PlugInKey{select.value().text(0), select.value().text(1), select.value().optionalText(4)});
+  }
+}
+
+os::Result<std::optional<Store::PlugInKey>> Store::plugInKeyAtPath(const std::string& path) {
+  os::Result<std::vector<PlugInKey>> keys = plugInKeys("path", path);
+  if (!keys.ok()) return keys.error();
+  if (keys.value().empty()) return std::optional<PlugInKey>();
+  return std::optional<PlugInKey>(std::move(keys.value().front()));
+}
+
+os::Result<std::vector<Store::PlugInKey>> Store::plugInKeysOfApplication(const std::string& path) {
+  return plugInKeys("application_path", path);
+}
+
+os::Result<std::vector<std::string>> Store::plugInUuids() {
+  os::Result<Statement> select = db_->prepare("SELECT uuid FROM plugins");
+  if (!select.ok()) return select.error();
+  std::vector<std::string> uuids;
+  for (;;) {
+    os::Result<bool> row = select.value().step();
+    if (!row.ok()) return row.error();
+    if (!row.value()) return uuids;
+    uuids.push_back(select.value().text(0));
+  }
+}
+
+os::Status Store::deletePlugInAtPath(const std::string& path) {
+  os::Result<Statement> remove = db_->prepare("DELETE FROM plugins WHERE path = ?");
   if (!remove.ok()) return remove.error();
-  return remove.value().bind(1, uuid.string()).run();
+  return remove.value().bind(1, path).run();
 }
 
 os::Status Store::deleteApplication(const std::string& path) {
@@ -192,7 +282,10 @@ os::Result<std::shared_ptr<const PlugInRecord>> Store::onePlugIn(const std::stri
   os::Result<bool> row = select.value().step();
   if (!row.ok()) return row.error();
   if (!row.value()) return std::shared_ptr<const PlugInRecord>();
-  return plugInRow(select.value(), sdkGeneration);
+  os::Result<std::shared_ptr<const PlugInRecord>> record = plugInRow(select.value(), sdkGeneration);
+  if (record.ok()) return record;
+  reportDamaged(select.value().text(0), record.error());
+  return std::shared_ptr<const PlugInRecord>();
 }
 
 os::Result<PlugInList> Store::plugInRows(Statement& statement) {
@@ -203,16 +296,42 @@ os::Result<PlugInList> Store::plugInRows(Statement& statement) {
     if (!row.ok()) return row.error();
     if (!row.value()) return plugIns;
     os::Result<std::shared_ptr<const PlugInRecord>> record = plugInRow(statement, sdkGeneration);
-    if (!record.ok()) return record.error();
-    plugIns.push_back(std::move(record.value()));
+    if (record.ok()) {
+      plugIns.push_back(std::move(record.value()));
+    } else {
+      reportDamaged(statement.text(0), record.error());
+    }
   }
+}
+
+os::Result<std::vector<Store::PlugInKey>> Store::plugInKeys(const std::string& where,
+                                                            const std::string& key) {
+  os::Result<Statement> select =
+      db_->prepare(std::string(kKeySelect) + "WHERE " + where + " = ? ORDER BY path");
+  if (!select.ok()) return select.error();
+  select.value().bind(1, key);
+  std::vector<PlugInKey> keys;
+  for (;;) {
+    os::Result<bool> row = select.value().step();
+    if (!row.ok()) return row.error();
+    if (!row.value()) return keys;
+    keys.push_back(
+        PlugInKey{select.value().text(0), select.value().text(1), select.value().optionalText(2)});
+  }
+}
+
+void Store::reportDamaged(const std::string& uuid, const os::Error& error) {
+  if (!reportedDamaged_.insert(uuid).second) return;
+  os::Log::write(kLogWarning, error.message +
+                                  " (left out as damaged; unregister it or register "
+                                  "its bundle again)");
 }
 
 os::Result<std::shared_ptr<const PlugInRecord>> Store::plugInRow(const Statement& row,
                                                                  std::uint64_t sdkGeneration) {
   PlugInRecord::Fields fields;
-  std::string uuid = row.text(0);
-  std::optional<value::Uuid> parsed = value::Uuid::parse(uuid);
+  std::string uuid = row.text(0) + " at " + row.text(1);
+  std::optional<value::Uuid> parsed = value::Uuid::parse(row.text(0));
   if (!parsed) return os::Error{EIO, "registry database: malformed plug-in UUID " + uuid};
   fields.uuid = *parsed;
   fields.bundlePath = row.text(1);

@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -29,6 +30,14 @@ class Store {
     std::vector<std::uint8_t> records;  // RecordCodec::encodeList
   };
 
+  // What a plug-in row says without decoding its dictionaries: enough to find, replace or remove
+  // a row that no longer decodes. |uuid| is the column's text as stored.
+  struct PlugInKey {
+    std::string uuid;
+    std::string path;
+    std::optional<std::string> dataContainer;
+  };
+
   // Which plug-ins plugIns() returns; every unset criterion admits all.
   struct Selection {
     std::optional<std::string> plugInIdentifier;
@@ -38,26 +47,41 @@ class Store {
   };
 
   // Opens the database file at |path| and makes sure its schema is in place. Plug-in rows are
-  // resolved against |sdks|, which the store shares.
+  // resolved against |sdks|, which the store shares. A file that is no database, holds another
+  // program's tables or has a later schema version is renamed to "<path>.damaged-<seconds>",
+  // with its -wal and -shm and the paths |keptWith| (what belongs to its records), logged, and
+  // replaced by an empty database.
   static os::Result<std::unique_ptr<Store>> open(const std::string& path,
-                                                 std::shared_ptr<sdk::SdkCache> sdks);
+                                                 std::shared_ptr<sdk::SdkCache> sdks,
+                                                 const std::vector<std::string>& keptWith = {});
 
   Database& database() { return *db_; }
 
-  // Lookups: a null pointer when there is no such row.
+  // Lookups: a null pointer when there is no such row. A damaged row (one whose UUID or
+  // dictionaries do not decode) is left out of every lookup and list, as if absent; the first
+  // time this Store meets it, it logs one line naming it.
   os::Result<std::shared_ptr<const ApplicationRecord>> application(const std::string& path);
   os::Result<std::shared_ptr<const PlugInRecord>> plugInByUuid(const value::Uuid& uuid);
   os::Result<std::shared_ptr<const PlugInRecord>> plugInByPath(const std::string& path);
   os::Result<PlugInList> plugInsOfApplication(const std::string& path);
   os::Result<std::vector<std::shared_ptr<const ApplicationRecord>>> applications();
   os::Result<PlugInList> plugIns(const Selection& selection);
+  // The keys of the rows the lookups above leave out as damaged, in path order.
+  os::Result<std::vector<PlugInKey>> damagedPlugIns();
+  // The key of the plug-in row at |path| (damaged or not); nothing when there is none.
+  os::Result<std::optional<PlugInKey>> plugInKeyAtPath(const std::string& path);
+  // The keys of every plug-in row of the application at |path| (damaged or not).
+  os::Result<std::vector<PlugInKey>> plugInKeysOfApplication(const std::string& path);
+  // The UUID text of every plug-in row, damaged or not.
+  os::Result<std::vector<std::string>> plugInUuids();
 
   // Inserts or updates the row of |fields|.path (applications) or |fields|.uuid (plug-ins). A
   // plug-in's stored identifier and extension point are derived from |fields| as given, so the
   // caller passes the bundle's own plug-in dictionary, not a resolved one.
   os::Status putApplication(const ApplicationRecord::Fields& fields);
   os::Status putPlugIn(const PlugInRecord::Fields& fields);
-  os::Status deletePlugIn(const value::Uuid& uuid);
+  // Deletes the plug-in row at |path| without reading it; success when there is none.
+  os::Status deletePlugInAtPath(const std::string& path);
   // Deletes the application at |path| and every plug-in row that names it.
   os::Status deleteApplication(const std::string& path);
 
@@ -75,6 +99,9 @@ class Store {
   os::Result<std::shared_ptr<const PlugInRecord>> onePlugIn(const std::string& where,
                                                             const std::string& key);
   os::Result<PlugInList> plugInRows(Statement& statement);
+  os::Result<std::vector<PlugInKey>> plugInKeys(const std::string& where, const std::string& key);
+  // Logs |error| about a damaged row once per row and Store.
+  void reportDamaged(const std::string& uuid, const os::Error& error);
   // The record of |row|, resolved against the SDKs of |sdkGeneration|.
   os::Result<std::shared_ptr<const PlugInRecord>> plugInRow(const Statement& row,
                                                             std::uint64_t sdkGeneration);
@@ -82,6 +109,7 @@ class Store {
 
   std::unique_ptr<Database> db_;
   const std::shared_ptr<sdk::SdkCache> sdks_;
+  std::set<std::string> reportedDamaged_;
 };
 
 }  // namespace registrum

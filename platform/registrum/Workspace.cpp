@@ -4,6 +4,7 @@
 #include <chrono>
 #include <filesystem>
 #include <map>
+#include <set>
 
 #include "platform/os/Log.h"
 #include "platform/os/Paths.h"
@@ -91,10 +92,12 @@ os::Result<std::shared_ptr<Workspace>> Workspace::open(const std::string& root) 
   std::string rootPath = canonicalRoot.value() == "/" ? "" : canonicalRoot.value();
   auto sdks = std::make_shared<sdk::SdkCache>(rootPath.empty() ? "/" : rootPath);
   os::Result<std::unique_ptr<Store>> store =
-      Store::open(rootPath + "/var/db/registrum.sqlite", sdks);
+      Store::open(rootPath + "/var/db/registrum.sqlite", sdks, {rootPath + "/var/containers"});
   if (!store.ok()) return store.error();
-  return std::shared_ptr<Workspace>(
+  std::shared_ptr<Workspace> workspace(
       new Workspace(rootPath, std::move(sdks), std::move(store.value())));
+  workspace->reclaimContainers();
+  return workspace;
 }
 
 Workspace::Workspace(std::string root, std::shared_ptr<sdk::SdkCache> sdks,
@@ -166,6 +169,11 @@ os::Result<PlugInList> Workspace::listPlugIns() const {
   return store_->plugIns(Store::Selection{});
 }
 
+os::Result<std::vector<Store::PlugInKey>> Workspace::listDamagedPlugIns() const {
+  std::lock_guard lock(storeMutex_);
+  return store_->damagedPlugIns();
+}
+
 os::Result<PlugInList> Workspace::query(const value::Dictionary& rule, const Filter& filter) const {
   Store::Selection selection{plainString(rule, "QSExtensionIdentifier"),
                              plainString(rule, "QSExtensionPointIdentifier"), true};
@@ -192,11 +200,15 @@ os::Result<std::shared_ptr<const PlugInRecord>> Workspace::registerPlugIn(const 
     os::Result<std::shared_ptr<const ApplicationRecord>> application =
         containingApplication(bundle.value());
     if (!application.ok()) return application.error();
+    os::Result<std::optional<Store::PlugInKey>> earlierKey =
+        store_->plugInKeyAtPath(bundle.value().path);
+    if (!earlierKey.ok()) return earlierKey.error();
+    // Null for a damaged row, which is replaced without a notice: no observer ever saw it.
     os::Result<std::shared_ptr<const PlugInRecord>> earlier =
         store_->plugInByPath(bundle.value().path);
     if (!earlier.ok()) return earlier.error();
     os::Result<std::shared_ptr<const PlugInRecord>> stored = storePlugIn(
-        bundle.value(), application.value(), earlier.value(), options.dataContainer, files);
+        bundle.value(), application.value(), earlierKey.value(), options.dataContainer, files);
     if (!stored.ok()) return stored.error();
     registered = stored.value();
     // Observers that keep what a record said (a cache) hear that the old one went first.
@@ -213,12 +225,16 @@ os::Result<std::shared_ptr<const PlugInRecord>> Workspace::registerPlugIn(const 
 os::Status Workspace::unregisterPlugIn(const std::string& path) {
   std::string key = lookupKey(path);
   return change([&](PendingFiles& files) -> os::Status {
+    os::Result<std::optional<Store::PlugInKey>> row = store_->plugInKeyAtPath(key);
+    if (!row.ok()) return row.error();
+    if (!row.value()) return os::Error{ENOENT, "no plug-in is registered at " + key};
+    // Null for a damaged row: it goes without a notice, as no observer ever saw it.
     os::Result<std::shared_ptr<const PlugInRecord>> record = store_->plugInByPath(key);
     if (!record.ok()) return record.error();
-    if (!record.value()) return os::Error{ENOENT, "no plug-in is registered at " + key};
-    os::Status removed = store_->deletePlugIn(record.value()->uuid());
+    os::Status removed = store_->deletePlugInAtPath(key);
     if (!removed.ok()) return removed;
-    if (auto container = record.value()->dataContainerPath()) files.retired.push_back(*container);
+    retireContainer(*row.value(), files);
+    if (!record.value()) return os::success();
     return store_->appendChange(Store::ChangeKind::Uninstall, {record.value()});
   });
 }
@@ -249,7 +265,7 @@ os::Result<Installation> Workspace::installApplication(const std::string& path,
     if (!put.ok()) return put;
     PlugInList installed;
     for (const PlugInBundle& bundle : bundles.value()) {
-      os::Result<std::shared_ptr<const PlugInRecord>> earlier = store_->plugInByPath(bundle.path);
+      os::Result<std::optional<Store::PlugInKey>> earlier = store_->plugInKeyAtPath(bundle.path);
       if (!earlier.ok()) return earlier.error();
       os::Result<std::shared_ptr<const PlugInRecord>> stored =
           storePlugIn(bundle, application, earlier.value(), options.dataContainer, files);
@@ -295,11 +311,11 @@ os::Status Workspace::uninstallApplication(const std::string& path) {
     if (!application.value()) return os::Error{ENOENT, "no application is installed at " + key};
     os::Result<PlugInList> plugIns = store_->plugInsOfApplication(key);
     if (!plugIns.ok()) return plugIns.error();
+    os::Result<std::vector<Store::PlugInKey>> rows = store_->plugInKeysOfApplication(key);
+    if (!rows.ok()) return rows.error();
     os::Status removed = store_->deleteApplication(key);
     if (!removed.ok()) return removed;
-    for (const auto& record : plugIns.value()) {
-      if (auto container = record->dataContainerPath()) files.retired.push_back(*container);
-    }
+    for (const Store::PlugInKey& row : rows.value()) retireContainer(row, files);
     if (plugIns.value().empty()) return os::success();
     return store_->appendChange(Store::ChangeKind::Uninstall, plugIns.value());
   });
@@ -320,6 +336,47 @@ std::string Workspace::notifyFile() const {
 
 std::string Workspace::containerPath(const value::Uuid& uuid) const {
   return root_ + "/var/containers/" + uuid.string();
+}
+
+void Workspace::retireContainer(const Store::PlugInKey& row, PendingFiles& files) const {
+  std::optional<value::Uuid> uuid = value::Uuid::parse(row.uuid);
+  if (row.dataContainer && uuid) files.retired.push_back(containerPath(*uuid));
+}
+
+void Workspace::reclaimContainers() {
+  std::string directory = root_ + "/var/containers";
+  std::lock_guard lock(storeMutex_);
+  // Under the write lock no other process is between making a container and committing its
+  // row, so every container without a row is an orphan.
+  os::Status status = store_->database().transaction([&]() -> os::Status {
+    os::Result<std::vector<std::string>> uuids = store_->plugInUuids();
+    if (!uuids.ok()) return uuids.error();
+    std::set<std::string> registered;
+    for (const std::string& text : uuids.value()) {
+      if (std::optional<value::Uuid> uuid = value::Uuid::parse(text)) {
+        registered.insert(uuid->string());
+      }
+    }
+    std::error_code error;
+    for (const auto& entry : std::filesystem::directory_iterator(directory, error)) {
+      std::optional<value::Uuid> uuid = value::Uuid::parse(entry.path().filename().string());
+      std::error_code typeError;
+      if (!uuid || registered.count(uuid->string()) || !entry.is_directory(typeError) ||
+          entry.is_symlink(typeError)) {
+        continue;
+      }
+      os::Log::write(kLogWarning, "registry: removing the orphan data container " +
+                                      entry.path().string() + " (no plug-in has its UUID)");
+      removeAll({entry.path().string()});
+    }
+    if (error && error != std::errc::no_such_file_or_directory) {
+      return os::Error{error.value(), "cannot list " + directory + ": " + error.message()};
+    }
+    return os::success();
+  });
+  if (!status.ok()) {
+    os::Log::write(kLogWarning, "registry: orphan data containers stay: " + status.error().message);
+  }
 }
 
 std::string Workspace::lookupKey(const std::string& path) {
@@ -385,9 +442,11 @@ os::Result<std::vector<PlugInBundle>> Workspace::readPlugInsOf(
 
 os::Result<std::shared_ptr<const PlugInRecord>> Workspace::storePlugIn(
     const PlugInBundle& bundle, std::shared_ptr<const ApplicationRecord> application,
-    const std::shared_ptr<const PlugInRecord>& earlier, bool dataContainer, PendingFiles& files) {
+    const std::optional<Store::PlugInKey>& earlier, bool dataContainer, PendingFiles& files) {
   PlugInRecord::Fields fields;
-  fields.uuid = earlier ? earlier->uuid() : value::Uuid::random();
+  std::optional<value::Uuid> earlierUuid;
+  if (earlier) earlierUuid = value::Uuid::parse(earlier->uuid);
+  fields.uuid = earlierUuid ? *earlierUuid : value::Uuid::random();
   fields.bundlePath = bundle.path;
   fields.containingApplication = std::move(application);
   fields.entitlements = bundle.entitlements;
@@ -403,8 +462,8 @@ os::Result<std::shared_ptr<const PlugInRecord>> Workspace::storePlugIn(
     os::Status made = os::Paths::ensureDirectory(container, 0700);
     if (!made.ok()) return made.error();
     fields.dataContainerPath = container;
-  } else if (earlier && earlier->dataContainerPath()) {
-    files.retired.push_back(*earlier->dataContainerPath());
+  } else if (earlier) {
+    retireContainer(*earlier, files);
   }
   RecordFields::derive(fields);
   os::Status put = store_->putPlugIn(fields);

@@ -11,6 +11,7 @@
 #include "platform/registrum/ApplicationRecord.h"
 #include "platform/registrum/Observer.h"
 #include "platform/registrum/PlugInRecord.h"
+#include "platform/registrum/Store.h"
 #include "platform/sdk/SdkCache.h"
 #include "platform/value/Value.h"
 
@@ -40,7 +41,6 @@ struct Installation {
 };
 
 class ChangeWatcher;
-class Store;
 struct PlugInBundle;
 
 // The application registry of one device root: the SQLite database
@@ -75,9 +75,12 @@ class Workspace {
   static os::Result<std::shared_ptr<Workspace>> defaultWorkspace();
 
   // A workspace of the device root |root|, separate from the default one (its own connection
-  // and notice thread). Creates "<root>/var/db" and the database when missing. Fails with the
-  // error of the directory or database that could not be opened, or EIO for a database of an
-  // unknown schema version.
+  // and notice thread). Creates "<root>/var/db" and the database when missing. A database file
+  // that is no SQLite database, holds another program's tables or has a later schema version is
+  // renamed to "registrum.sqlite.damaged-<seconds>" (with its -wal and -shm, and
+  // "var/containers", whose containers belong to its records), logged, and replaced by an empty
+  // registry. Then reclaims orphan data containers (reclaimContainers).
+  // Fails with the error of the directory or database that could not be opened.
   static os::Result<std::shared_ptr<Workspace>> open(const std::string& root);
 
   ~Workspace();
@@ -120,6 +123,10 @@ class Workspace {
   os::Result<std::vector<std::shared_ptr<const ApplicationRecord>>> listApplications() const;
   // Every installed plug-in in path order, except those of placeholder applications.
   os::Result<PlugInList> listPlugIns() const;
+  // The plug-in rows that every lookup, list and query leaves out because they no longer decode
+  // (each logged once), in path order. unregisterPlugIn and uninstallApplication remove them,
+  // and registering the bundle at their path again replaces them, keeping their UUID.
+  os::Result<std::vector<Store::PlugInKey>> listDamagedPlugIns() const;
 
   // The installed plug-ins (placeholders' excluded) that may satisfy |rule|, for which
   // |filter| (when set) returns true. The filter runs on the calling thread with no registry
@@ -190,10 +197,17 @@ class Workspace {
   static os::Result<std::vector<PlugInBundle>> readPlugInsOf(const std::string& application,
                                                              std::vector<SkippedBundle>& skipped);
   // Writes the plug-in row of |bundle|, keeping the UUID and data container of |earlier|, the
-  // row registered at its path before (null when none was).
+  // row registered at its path before (nothing when none was), damaged or not.
   os::Result<std::shared_ptr<const PlugInRecord>> storePlugIn(
       const PlugInBundle& bundle, std::shared_ptr<const ApplicationRecord> application,
-      const std::shared_ptr<const PlugInRecord>& earlier, bool dataContainer, PendingFiles& files);
+      const std::optional<Store::PlugInKey>& earlier, bool dataContainer, PendingFiles& files);
+  // Queues the data container of |row| for removal once the change commits. Only the container
+  // named by its UUID is touched: a damaged row's stored path is not trusted.
+  void retireContainer(const Store::PlugInKey& row, PendingFiles& files) const;
+  // Removes the directories of "var/containers" named by a UUID that no plug-in row has (left by
+  // a process killed between making a container and committing its row). Symbolic links and
+  // other names are left alone. Logs each removal, and a failure, which is not fatal.
+  void reclaimContainers();
 
   const std::string root_;
   const std::shared_ptr<sdk::SdkCache> sdks_;

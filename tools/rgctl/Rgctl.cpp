@@ -71,6 +71,13 @@ int Rgctl::list() {
     json["plugins"].push_back(RecordJson::brief(*plugIn));
     if (!options_.json) std::cout << RecordText::plugInLine(*plugIn) << "\n";
   }
+  auto damaged = workspace_->listDamagedPlugIns();
+  if (!damaged.ok()) return fail(damaged.error());
+  json["damaged"] = ordered_json::array();
+  for (const registrum::Store::PlugInKey& row : damaged.value()) {
+    json["damaged"].push_back({{"path", row.path}, {"uuid", row.uuid}});
+    if (!options_.json) std::cout << "damaged " << row.path << " " << row.uuid << "\n";
+  }
   if (options_.json) std::cout << json.dump(2) << "\n";
   return 0;
 }
