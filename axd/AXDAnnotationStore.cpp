@@ -8,8 +8,8 @@
 #include <cstdio>
 #include <cstdlib>
 #include <ctime>
-#include <fstream>
 #include <map>
+#include <sstream>
 
 #include "Annexa/AXInternalConsistency.h"
 #include "axd/AXDPlugIn.h"
@@ -18,6 +18,7 @@
 #include "platform/os/Log.h"
 #include "platform/os/Paths.h"
 #include "platform/os/Probes.h"
+#include "platform/sandbox/FileReading.h"
 #include "platform/value/PropertyList.h"
 #include "platform/value/Value.h"
 
@@ -80,9 +81,10 @@ std::optional<AXError> readTable(const std::string& path, value::Dictionary* tab
 // changing it, which would briefly give files made by other threads the wrong mode. Without
 // /proc, 077: the temporary file's own mode 0600 stays.
 mode_t creationMask() {
-  std::ifstream status("/proc/self/status");
+  auto status = sandbox::FileReading::readUpTo("/proc/self/status", 16 * 1024);
+  std::istringstream lines(status.ok() ? status.value() : std::string());
   std::string line;
-  while (std::getline(status, line)) {
+  while (std::getline(lines, line)) {
     if (line.rfind("Umask:", 0) == 0) {
       return static_cast<mode_t>(std::strtoul(line.c_str() + 6, nullptr, 8));
     }

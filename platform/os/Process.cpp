@@ -1,6 +1,7 @@
 #include "platform/os/Process.h"
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
@@ -8,7 +9,6 @@
 #include <climits>
 #include <csignal>
 #include <cstdlib>
-#include <fstream>
 #include <sstream>
 #include <vector>
 
@@ -37,6 +37,19 @@ std::vector<std::string> fieldsAfterCommand(const std::string& line) {
   std::istringstream rest(line.substr(end + 1));
   for (std::string field; rest >> field;) fields.push_back(field);
   return fields;
+}
+
+// The first line of a small /proc file; empty when it cannot be read. Not through a stream,
+// which would leave the descriptor open across a concurrent exec.
+std::string firstLine(const std::string& path) {
+  int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+  if (fd < 0) return std::string();
+  char buffer[4096];
+  ssize_t n = read(fd, buffer, sizeof buffer);
+  close(fd);
+  if (n <= 0) return std::string();
+  std::string text(buffer, static_cast<std::size_t>(n));
+  return text.substr(0, text.find('\n'));
 }
 
 Error noPidfd() {
@@ -76,11 +89,8 @@ Result<std::string> Process::executablePath(pid_t pid, int pidfd) {
 
 Result<std::uint64_t> Process::startTime(pid_t pid) {
   const std::string path = "/proc/" + std::to_string(pid) + "/stat";
-  std::ifstream stat(path);
-  std::string line;
-  if (pid <= 0 || !stat || !std::getline(stat, line)) {
-    return Error{ESRCH, "no process " + std::to_string(pid)};
-  }
+  std::string line = pid > 0 ? firstLine(path) : std::string();
+  if (line.empty()) return Error{ESRCH, "no process " + std::to_string(pid)};
   constexpr std::size_t kStartTime = 22 - 3;
   std::vector<std::string> fields = fieldsAfterCommand(line);
   char* end = nullptr;
@@ -102,6 +112,13 @@ Result<int> Process::openExecutable(pid_t pid, int pidfd) {
     return alive.error();
   }
   return fd;
+}
+
+Result<FileIdentity> Process::executableIdentity(pid_t pid) {
+  std::string link = exeLink(pid);
+  struct stat status {};
+  if (stat(link.c_str(), &status) != 0) return Error::fromErrno("stat " + link);
+  return FileIdentity{status.st_dev, status.st_ino};
 }
 
 }  // namespace os

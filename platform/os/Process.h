@@ -9,6 +9,13 @@
 
 namespace os {
 
+// A file as the kernel names it, whatever path led to it.
+struct FileIdentity {
+  dev_t device = 0;
+  ino_t inode = 0;
+  bool operator==(const FileIdentity&) const = default;
+};
+
 // Facts about other processes, checked against a pidfd so that a process id the kernel has
 // since given to a new process is never mistaken for the one we mean. Stateless; safe to call
 // from any thread.
@@ -38,6 +45,12 @@ class Process {
   // replaced or removed since), checked against |pidfd| like executablePath(). The caller owns
   // the descriptor. Fails as executablePath() does.
   static Result<int> openExecutable(pid_t pid, int pidfd);
+
+  // The file that |pid| runs, as device and inode numbers (one stat of /proc/<pid>/exe): equal
+  // answers at two times mean the process ran the same program file then, so an exec of another
+  // program in between shows. Fails with ENOENT for a zombie or a process that is gone, EACCES
+  // for a process we may not inspect.
+  static Result<FileIdentity> executableIdentity(pid_t pid);
 };
 
 }  // namespace os

@@ -5,6 +5,7 @@
 
 #include <asio/post.hpp>
 #include <cerrno>
+#include <cstring>
 
 #include "platform/os/Format.h"
 #include "platform/os/Log.h"
@@ -40,7 +41,7 @@ const char* kindName(FrameKind kind) {
 std::shared_ptr<Connection> Connection::toService(std::string serviceName,
                                                   std::shared_ptr<StrandQueue> queue) {
   asio::local::stream_protocol::socket socket(queue->context());
-  return std::shared_ptr<Connection>(new Connection(std::move(socket), PeerCredentials{},
+  return std::shared_ptr<Connection>(new Connection(std::move(socket), PeerCredentials{}, false,
                                                     std::move(serviceName), std::move(queue),
                                                     FrameLimits::fromEnvironment()));
 }
@@ -49,16 +50,17 @@ std::shared_ptr<Connection> Connection::accepted(asio::local::stream_protocol::s
                                                  PeerCredentials peer, std::string serviceName,
                                                  FrameLimits limits) {
   auto queue = std::make_shared<StrandQueue>("zyn.connection");
-  return std::shared_ptr<Connection>(
-      new Connection(std::move(socket), peer, std::move(serviceName), std::move(queue), limits));
+  return std::shared_ptr<Connection>(new Connection(
+      std::move(socket), peer, true, std::move(serviceName), std::move(queue), limits));
 }
 
 Connection::Connection(asio::local::stream_protocol::socket socket, PeerCredentials peer,
-                       std::string serviceName, std::shared_ptr<StrandQueue> queue,
+                       bool checksPeer, std::string serviceName, std::shared_ptr<StrandQueue> queue,
                        FrameLimits limits)
     : queue_(std::move(queue)),
       socket_(std::move(socket)),
       peer_(peer),
+      checksPeer_(checksPeer),
       serviceName_(std::move(serviceName)),
       limits_(limits),
       decoder_(limits_) {}
@@ -84,7 +86,16 @@ void Connection::resume() {
 void Connection::connectToService() {
   std::string path = os::Paths::zynSocketDir() + "/" + serviceName_;
   std::error_code ec;
-  socket_.connect(asio::local::stream_protocol::endpoint(path), ec);
+  // Opened here, not by asio, which would leave it open across an exec: a child of the client
+  // must not inherit its connection.
+  int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  if (fd < 0) {
+    ec = std::error_code(errno, std::system_category());
+  } else {
+    socket_.assign(asio::local::stream_protocol(), fd, ec);
+    if (ec) close(fd);
+  }
+  if (!ec) socket_.connect(asio::local::stream_protocol::endpoint(path), ec);
   if (ec) {
     std::lock_guard lock(writeMutex_);
     closed_ = true;
@@ -98,27 +109,83 @@ void Connection::readMore() {
     return;
   }
   auto self = shared_from_this();
-  std::uint8_t* space = decoder_.prepare(kReadChunk);
-  socket_.async_read_some(asio::buffer(space, kReadChunk), [self](std::error_code ec,
-                                                                  std::size_t n) {
+  socket_.async_wait(asio::socket_base::wait_read, [self](std::error_code ec) {
     if (ec) {
-      self->invalidate(ec == asio::error::eof ? "the peer closed the connection" : ec.message());
+      self->invalidate(ec.message());
       return;
     }
-    self->decoder_.commit(n);
-    for (;;) {
-      auto next = self->decoder_.next();
-      if (!next.ok()) {
-        os::Log::write(4, os::format("closing connection %@: %s",
-                                     {self->description(), next.error().message}));
-        self->invalidate(next.error().message);
-        return;
-      }
-      if (!next.value()) break;
-      self->received(std::move(*next.value()));
-    }
-    self->readMore();
+    self->readAvailable();
   });
+}
+
+void Connection::readAvailable() {
+  auto n = receive();
+  if (!n.ok() && n.error().errnum == EAGAIN) {
+    readMore();
+    return;
+  }
+  if (!n.ok() || n.value() == 0) {
+    std::string why = n.ok() ? "the peer closed the connection" : n.error().message;
+    if (!n.ok() && n.error().errnum == EPERM) {
+      os::Log::write(4, os::format("closing connection %@: %s", {description(), why}));
+    }
+    invalidate(why);
+    return;
+  }
+  decoder_.commit(n.value());
+  for (;;) {
+    auto next = decoder_.next();
+    if (!next.ok()) {
+      os::Log::write(
+          4, os::format("closing connection %@: %s", {description(), next.error().message}));
+      invalidate(next.error().message);
+      return;
+    }
+    if (!next.value()) break;
+    // Only work is checked: a goodbye from a client that has exited since is no harm.
+    bool work = next.value()->kind == FrameKind::Request || next.value()->kind == FrameKind::OneWay;
+    if (work && !peerRunsSameProgram()) {
+      std::string why = "the peer is gone or runs another program than when it connected";
+      os::Log::write(4, os::format("closing connection %@: %s", {description(), why}));
+      invalidate(why);
+      return;
+    }
+    received(std::move(*next.value()));
+  }
+  readMore();
+}
+
+os::Result<std::size_t> Connection::receive() {
+  iovec space{decoder_.prepare(kReadChunk), kReadChunk};
+  alignas(cmsghdr) char control[CMSG_SPACE(sizeof(ucred))];
+  msghdr message{};
+  message.msg_iov = &space;
+  message.msg_iovlen = 1;
+  message.msg_control = control;
+  message.msg_controllen = sizeof control;
+  ssize_t n;
+  do {
+    n = recvmsg(socket_.native_handle(), &message, MSG_DONTWAIT | MSG_CMSG_CLOEXEC);
+  } while (n < 0 && errno == EINTR);
+  if (n < 0) return os::Error::fromErrno("read");
+  if (n == 0 || !checksPeer_) return static_cast<std::size_t>(n);
+  // The kernel never joins bytes of different writers in one read, so one check covers them.
+  ucred writer{};
+  cmsghdr* header = CMSG_FIRSTHDR(&message);
+  if (header && header->cmsg_level == SOL_SOCKET && header->cmsg_type == SCM_CREDENTIALS) {
+    std::memcpy(&writer, CMSG_DATA(header), sizeof writer);
+  }
+  if (writer.pid != peer_.pid || writer.uid != peer_.uid) {
+    return os::Error{EPERM, os::format("bytes written by pid %d uid %u, not by the peer",
+                                       {writer.pid, writer.uid})};
+  }
+  return static_cast<std::size_t>(n);
+}
+
+bool Connection::peerRunsSameProgram() const {
+  if (!checksPeer_) return true;
+  auto now = os::Process::executableIdentity(peer_.pid);
+  return peer_.program && now.ok() && now.value() == *peer_.program;
 }
 
 void Connection::received(Frame frame) {

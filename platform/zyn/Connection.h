@@ -13,6 +13,7 @@
 #include <unordered_map>
 #include <vector>
 
+#include "platform/os/Process.h"
 #include "platform/zyn/Frame.h"
 #include "platform/zyn/Message.h"
 #include "platform/zyn/Reply.h"
@@ -27,6 +28,8 @@ struct PeerCredentials {
   gid_t gid = static_cast<gid_t>(-1);
   // A pidfd for the peer: its audit token. -1 when the kernel could give none.
   int pidfd = -1;
+  // The program file the peer ran when the connection was accepted; nothing when unknown.
+  std::optional<os::FileIdentity> program;
 };
 
 // One connection of the message service, either end. Events (messages and the two terminal
@@ -35,9 +38,11 @@ struct PeerCredentials {
 // any thread and never blocks: what the socket cannot take at once waits in a bounded backlog,
 // and a peer that lets the backlog grow past its bound is disconnected. A frame over the
 // connection's frame limit is neither read (the connection is closed) nor sent (refused, and the
-// connection goes on). A
-// connection stays alive while it is resumed and its socket open; the connection-invalid event
-// is its last.
+// connection goes on). On the daemon's side only the process that connected may speak, and only
+// as the program it ran then: bytes written by another process (a child that inherited the
+// socket) or a request or message that arrives after the peer exec'd another program close the
+// connection with a log line, undelivered. A connection stays alive while it is resumed and its
+// socket open; the connection-invalid event is its last.
 class Connection : public std::enable_shared_from_this<Connection> {
  public:
   using EventHandler = std::function<void(const Event&)>;
@@ -97,11 +102,18 @@ class Connection : public std::enable_shared_from_this<Connection> {
   std::string description() const;
 
  private:
-  Connection(asio::local::stream_protocol::socket socket, PeerCredentials peer,
+  Connection(asio::local::stream_protocol::socket socket, PeerCredentials peer, bool checksPeer,
              std::string serviceName, std::shared_ptr<StrandQueue> queue, FrameLimits limits);
 
   void connectToService();
   void readMore();
+  void readAvailable();
+  // Reads what the socket has into the decoder: the byte count (0 at the end of the stream), an
+  // EAGAIN error when there was nothing yet, or the error of the read. On the daemon's side an
+  // EPERM error when the bytes were written by another process than the peer.
+  os::Result<std::size_t> receive();
+  // True when the peer still runs the program it ran at accept (always on the client's side).
+  bool peerRunsSameProgram() const;
   void received(Frame frame);
   void receivedReply(Frame frame);
   // Takes the handler of request |id| out of pending_; null when it is not there.
@@ -118,6 +130,8 @@ class Connection : public std::enable_shared_from_this<Connection> {
   const std::shared_ptr<StrandQueue> queue_;
   asio::local::stream_protocol::socket socket_;
   const PeerCredentials peer_;
+  // Set on the daemon's side, where the writer of every read and the peer's program are checked.
+  const bool checksPeer_;
   const std::string serviceName_;
   EventHandler handler_;
   std::shared_ptr<void> context_;

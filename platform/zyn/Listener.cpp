@@ -60,6 +60,8 @@ PeerCredentials credentialsOf(int fd) {
     auto opened = os::Process::openPidfd(peer.pid);
     if (opened.ok()) peer.pidfd = opened.value();
   }
+  auto program = os::Process::executableIdentity(peer.pid);
+  if (peer.pid > 0 && program.ok()) peer.program = program.value();
   return peer;
 }
 
@@ -76,6 +78,15 @@ os::Result<std::shared_ptr<Listener>> Listener::create(const std::string& servic
     auto bound = bindSocket(path);
     if (!bound.ok()) return bound.error();
     fd = bound.value();
+  }
+  // Connections made from now on inherit SO_PASSCRED, so even their first bytes carry the
+  // writer's credentials; the listening socket is non-blocking for accept4.
+  int on = 1;
+  if (setsockopt(fd, SOL_SOCKET, SO_PASSCRED, &on, sizeof on) != 0 ||
+      fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) | O_NONBLOCK) != 0) {
+    os::Error error = os::Error::fromErrno("cannot set up the listening socket");
+    close(fd);
+    return error;
   }
   asio::local::stream_protocol::acceptor acceptor(Runtime::shared().context());
   std::error_code ec;
@@ -142,11 +153,15 @@ void Listener::resume() {
 
 void Listener::acceptNext() {
   auto self = shared_from_this();
-  acceptor_.async_accept([self](std::error_code ec, asio::local::stream_protocol::socket socket) {
+  acceptor_.async_wait(asio::socket_base::wait_read, [self](std::error_code ec) {
     if (!ec) {
-      self->accepted(std::move(socket));
-      self->acceptNext();
-      return;
+      while (self->acceptOne()) {
+      }
+      if (errno == EAGAIN || errno == EWOULDBLOCK || errno == EINTR || errno == ECONNABORTED) {
+        self->acceptNext();
+        return;
+      }
+      ec = std::error_code(errno, std::system_category());
     }
     // Out of descriptors or memory: retrying at once would only spin, so pause a little.
     os::Log::write(4, "accept on " + self->serviceName_ + " failed: " + ec.message());
@@ -155,8 +170,30 @@ void Listener::acceptNext() {
   });
 }
 
-void Listener::accepted(asio::local::stream_protocol::socket socket) {
-  PeerCredentials peer = credentialsOf(socket.native_handle());
+bool Listener::acceptOne() {
+  int fd = accept4(acceptor_.native_handle(), nullptr, nullptr, SOCK_CLOEXEC);
+  if (fd < 0) return false;
+  accepted(fd);
+  return true;
+}
+
+void Listener::accepted(int fd) {
+  // Only connections made after the listening socket got SO_PASSCRED inherit it; one made before
+  // (while a service manager held the socket) gets it now. Its bytes written before the accept
+  // carry credentials anyway, those written between the accept and now carry none and are
+  // refused.
+  int on = 1;
+  setsockopt(fd, SOL_SOCKET, SO_PASSCRED, &on, sizeof on);
+  PeerCredentials peer = credentialsOf(fd);
+  asio::local::stream_protocol::socket socket(acceptor_.get_executor());
+  std::error_code ec;
+  socket.assign(asio::local::stream_protocol(), fd, ec);
+  if (ec) {
+    os::Log::write(4, "cannot adopt a connection to " + serviceName_ + ": " + ec.message());
+    close(fd);
+    if (peer.pidfd >= 0) close(peer.pidfd);
+    return;
+  }
   auto connection = Connection::accepted(std::move(socket), peer, serviceName_, limits_);
   auto self = shared_from_this();
   queue_->async([self, connection] {

@@ -15,8 +15,10 @@ namespace zyn {
 // A named service's listening end: a Unix stream socket at <runtime dir>/zyn/<name> (directory
 // 0700, socket 0600), or the listening socket that the service manager handed over through
 // LISTEN_FDS. Each accepted connection is delivered, with its peer's credentials and audit token
-// taken at accept, to the event handler on the listener's queue. Accepting starts at resume().
-// The frame limits of its connections are read from the environment when it is created.
+// taken at accept, to the event handler on the listener's queue. The kernel tags every write with
+// its writer's credentials (SO_PASSCRED), so that a connection can tell who wrote its bytes.
+// Accepting starts at resume(). The frame limits of its connections are read from the environment
+// when it is created.
 class Listener : public std::enable_shared_from_this<Listener> {
  public:
   using EventHandler = std::function<void(std::shared_ptr<Connection>)>;
@@ -40,7 +42,9 @@ class Listener : public std::enable_shared_from_this<Listener> {
   static os::Result<int> inheritedSocket();
   static os::Result<int> bindSocket(const std::string& path);
   void acceptNext();
-  void accepted(asio::local::stream_protocol::socket socket);
+  // Accepts one waiting connection; false when none waited.
+  bool acceptOne();
+  void accepted(int fd);
 
   asio::local::stream_protocol::acceptor acceptor_;
   asio::steady_timer retry_;
