@@ -6,10 +6,8 @@
 
 #include <cerrno>
 #include <cstdio>
-#include <cstdlib>
 #include <ctime>
 #include <map>
-#include <sstream>
 
 #include "Annexa/AXInternalConsistency.h"
 #include "axd/AXDPlugIn.h"
@@ -18,7 +16,6 @@
 #include "platform/os/Log.h"
 #include "platform/os/Paths.h"
 #include "platform/os/Probes.h"
-#include "platform/sandbox/FileReading.h"
 #include "platform/value/PropertyList.h"
 #include "platform/value/Value.h"
 
@@ -75,21 +72,6 @@ std::optional<AXError> readTable(const std::string& path, value::Dictionary* tab
   std::optional<AXError> rejected = rejection(path, *top);
   if (!rejected) *table = annotationsIn(path, *top->find("data")->asDictionary());
   return rejected;
-}
-
-// The process's file-creation mask. Read from /proc because umask(2) can only read it by
-// changing it, which would briefly give files made by other threads the wrong mode. Without
-// /proc, 077: the temporary file's own mode 0600 stays.
-mode_t creationMask() {
-  auto status = sandbox::FileReading::readUpTo("/proc/self/status", 16 * 1024);
-  std::istringstream lines(status.ok() ? status.value() : std::string());
-  std::string line;
-  while (std::getline(lines, line)) {
-    if (line.rfind("Umask:", 0) == 0) {
-      return static_cast<mode_t>(std::strtoul(line.c_str() + 6, nullptr, 8));
-    }
-  }
-  return 077;
 }
 
 }  // namespace
@@ -176,8 +158,7 @@ bool AXDAnnotationStore::saveDb(std::optional<AXError>* error) {
   });
   os::Result<std::string> xml = value::PropertyList::toXml(top);
   os::Status written = xml.ok() ? os::AtomicFile::replace(annotationsURL_, xml.value(),
-                                                          os::AtomicFile::Durability::Durable,
-                                                          0666 & ~creationMask())
+                                                          os::AtomicFile::Durability::Durable, 0600)
                                 : xml.error();
   if (written.ok()) return true;
   if (error) *error = posixError(written.error());

@@ -71,8 +71,8 @@ class AXDAnnotationStore {
   bool loadDb(std::optional<AXError>* error);
 
   // Writes the table to annotationsURL() as an XML property list, atomically: the new content
-  // goes to a temporary file beside it ("<name>.XXXXXX", with the mode a new file of this
-  // process gets), is flushed to disk and renamed over the old file, and the directory is
+  // goes to a temporary file beside it ("<name>.XXXXXX", mode 0600: the user's elections are
+  // no one else's to read), is flushed to disk and renamed over the old file, and the directory is
   // flushed; a reader, or the file after a crash, is the old content or the new, never a part.
   // Returns true when all of it succeeded; otherwise false, with the error stored in |error|
   // when it is not null, the temporary file removed and the old file unchanged. Directories

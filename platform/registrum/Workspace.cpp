@@ -1,7 +1,10 @@
 #include "platform/registrum/Workspace.h"
 
+#include <sys/stat.h>
+
 #include <cerrno>
 #include <chrono>
+#include <cstring>
 #include <filesystem>
 #include <map>
 #include <set>
@@ -85,7 +88,7 @@ os::Result<std::shared_ptr<Workspace>> Workspace::defaultWorkspace() {
 
 os::Result<std::shared_ptr<Workspace>> Workspace::open(const std::string& root) {
   std::string databaseDirectory = root + "/var/db";
-  os::Status directory = os::Paths::ensureDirectory(databaseDirectory, 0755);
+  os::Status directory = os::Paths::ensureDirectory(databaseDirectory, 0700);
   if (!directory.ok()) return directory.error();
   os::Result<std::string> canonicalRoot = os::Paths::canonical(root);
   if (!canonicalRoot.ok()) return canonicalRoot.error();
@@ -94,6 +97,15 @@ os::Result<std::shared_ptr<Workspace>> Workspace::open(const std::string& root) 
   os::Result<std::unique_ptr<Store>> store =
       Store::open(rootPath + "/var/db/registrum.sqlite", sdks, {rootPath + "/var/containers"});
   if (!store.ok()) return store.error();
+  // The registry lists what the user installed: no one else's to read. SQLite gives its journal
+  // files the database file's mode.
+  for (const char* suffix : {"", "-wal", "-shm"}) {
+    std::string file = rootPath + "/var/db/registrum.sqlite" + suffix;
+    if (chmod(file.c_str(), 0600) != 0 && errno != ENOENT) {
+      os::Log::write(kLogWarning,
+                     "registry: cannot make " + file + " private: " + std::strerror(errno));
+    }
+  }
   std::shared_ptr<Workspace> workspace(
       new Workspace(rootPath, std::move(sdks), std::move(store.value())));
   workspace->reclaimContainers();

@@ -151,6 +151,7 @@ void CborBuilder::startContainer(Kind kind, std::optional<std::uint64_t> items) 
 
 // Hands a finished item to the innermost open container, closing every container it completes.
 void CborBuilder::deliver(Value value) {
+  if (++items_ > maxItems_) return fail(os::format("more than %u items", {maxItems_}));
   while (!stack_.empty()) {
     if (!add(stack_.back(), std::move(value))) return;
     value = finish(stack_.back());

@@ -18,7 +18,10 @@ namespace value {
 // ignores further events.
 class CborBuilder {
  public:
-  explicit CborBuilder(std::size_t maxDepth) : maxDepth_(maxDepth) {}
+  // A builder of at most |maxItems| items (scalars and containers alike) nested at most
+  // |maxDepth| deep.
+  CborBuilder(std::size_t maxDepth, std::size_t maxItems)
+      : maxDepth_(maxDepth), maxItems_(maxItems) {}
 
   // The number of input bytes that remain, counting the current item's head; counts that
   // declare more elements than this are refused before anything is allocated for them.
@@ -73,6 +76,8 @@ class CborBuilder {
   void fail(std::string message);
 
   std::size_t maxDepth_;
+  std::size_t maxItems_;
+  std::size_t items_ = 0;  // Items finished so far.
   std::size_t depth_ = 0;  // Open arrays, maps and envelopes.
   std::size_t bytesLeft_ = 0;
   std::optional<std::uint64_t> pendingTag_;

@@ -130,8 +130,9 @@ void CborCodec::encode(const Value& value, Out& out) {
   }
 }
 
-os::Result<Value> CborCodec::decode(std::span<const std::uint8_t> bytes, std::size_t maxDepth) {
-  CborBuilder builder(maxDepth);
+os::Result<Value> CborCodec::decode(std::span<const std::uint8_t> bytes, std::size_t maxDepth,
+                                    std::size_t maxItems) {
+  CborBuilder builder(maxDepth, maxItems);
   std::size_t offset = 0;
   while (!builder.done()) {
     std::size_t left = bytes.size() - offset;

@@ -33,9 +33,12 @@ class CborCodec {
   // with errnum EBADMSG naming the first problem and its byte offset: truncated or malformed
   // CBOR, bytes after the item, an item or tag outside the mapping (undefined, other simple
   // values, unknown tags, tag 37 over anything but 16 bytes), a map key that is not text or
-  // repeats, text that is not UTF-8, or deeper nesting. Works without recursion on the input.
+  // repeats, text that is not UTF-8, deeper nesting, or more than |maxItems| items (every
+  // scalar, string and container counts one), which bounds the memory a small input can make
+  // the decoder take. Works without recursion on the input.
   static os::Result<Value> decode(std::span<const std::uint8_t> bytes,
-                                  std::size_t maxDepth = kDefaultMaxDepth);
+                                  std::size_t maxDepth = kDefaultMaxDepth,
+                                  std::size_t maxItems = SIZE_MAX);
 };
 
 }  // namespace value

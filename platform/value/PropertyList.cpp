@@ -1,8 +1,8 @@
 #include "platform/value/PropertyList.h"
 
 #include <fcntl.h>
-#include <sys/stat.h>
 #include <plist/plist.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>

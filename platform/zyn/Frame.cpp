@@ -116,8 +116,10 @@ os::Result<std::optional<Frame>> FrameDecoder::next() {
   if (buffered() < kLengthBytes + *length) return std::optional<Frame>();
   auto kind = static_cast<FrameKind>(frame[kLengthBytes]);
   std::uint64_t id = getBigEndian(frame + kLengthBytes + 1, 8);
+  std::size_t itemBytes = *length - kMinLength;
   auto body =
-      value::CborCodec::decode({frame + kHeaderBytes, *length - kMinLength}, limits_.maxDepth);
+      value::CborCodec::decode({frame + kHeaderBytes, itemBytes}, limits_.maxDepth,
+                               itemBytes / FrameLimits::kItemBytes + FrameLimits::kSmallItems);
   if (!body.ok()) return broken(EBADMSG, os::format("frame %u: %s", {id, body.error().message}));
   begin_ += kLengthBytes + *length;
   if (begin_ == end_) {

@@ -36,6 +36,11 @@ struct FrameLimits {
   std::size_t maxFrameBytes = 64u << 20;
   // Deepest nesting of arrays, maps and envelopes in an item.
   std::size_t maxDepth = 128;
+  // An item may hold at most one value per kItemBytes bytes of its encoding, plus kSmallItems,
+  // so what a frame decodes to stays in proportion to its size: a value costs some 32 bytes in
+  // memory, and a run of one-byte items would otherwise turn 64 MiB into gigabytes.
+  static constexpr std::size_t kItemBytes = 4;
+  static constexpr std::size_t kSmallItems = 64;
 };
 
 // Appends the whole encoded frame to |out|: 4-byte big-endian length N of what follows, the kind

@@ -117,7 +117,8 @@ os::Result<int> Listener::inheritedSocket() {
 }
 
 os::Result<int> Listener::bindSocket(const std::string& path) {
-  auto made = os::Paths::ensureDirectory(os::Paths::zynSocketDir(), 0700);
+  // Another user who could write here could put a socket of theirs in the daemon's place.
+  auto made = os::Paths::ensureRuntimeDirectory(os::Paths::zynSocketDir(), 0700);
   if (!made.ok()) return made.error();
   auto address = socketAddress(path);
   if (!address.ok()) return address.error();

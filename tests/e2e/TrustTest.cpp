@@ -124,6 +124,16 @@ TEST_F(TrustTest, OneRequestCannotHoldTheDaemonOrFloodItsLog) {
   ASSERT_TRUE(raw->sendFrame(zyn::FrameKind::OneWay, 1, Value::string(std::string(1 << 20, 'x'))));
   ASSERT_TRUE(daemon().waitForLog("bytes cut)"));
   expectServing();
+
+  // A frame of one-byte items decodes to values some 32 times its size: refused, like a frame
+  // over the limit, before it is built.
+  std::unique_ptr<RawClient> dense = connectRaw();
+  ASSERT_TRUE(dense);
+  ASSERT_TRUE(dense->sendFrame(zyn::FrameKind::Request, 1,
+                               Value::array(value::Array(100000, Value::unsignedInteger(0)))));
+  EXPECT_TRUE(dense->closedByPeer());
+  EXPECT_EQ(logCount("more than 25065 items"), 1u);
+  expectServing();
   std::size_t longest = 0;
   std::string log = daemon().log();
   for (std::size_t start = 0, end; start < log.size(); start = end + 1) {
