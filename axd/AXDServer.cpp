@@ -2,6 +2,8 @@
 
 #include <unistd.h>
 
+#include <asio/post.hpp>
+
 #include "axd/AXDNames.h"
 #include "axd/AXDZynClient.h"
 #include "platform/launcher/ServiceLauncher.h"
@@ -11,6 +13,10 @@ namespace {
 
 // The user-initiated class: above ordinary work where the system lets us.
 constexpr int kServiceNiceness = -5;
+
+// Client set-ups that may run at once: enough that one client with a large executable to hash
+// does not hold up the next, few enough to bound what set-ups cost.
+constexpr std::size_t kSetUpThreads = 2;
 
 // Never destroyed, like the server it points to.
 std::shared_ptr<AXDServer>& sharedServer() {
@@ -27,6 +33,7 @@ std::shared_ptr<AXDServer> AXDServer::initForService(const char* serviceName,
   server->zynQueue_ = std::make_shared<zyn::StrandQueue>("zyn");
   server->mainQueue_ = std::make_shared<zyn::ThreadQueue>("service", kServiceNiceness);
   server->syncQueue_ = std::make_unique<zyn::SyncQueue>("serverSync");
+  server->setUpPool_ = std::make_unique<asio::thread_pool>(kSetUpThreads);
   auto listener = zyn::Listener::create(serviceName, server->zynQueue_);
   if (!listener.ok()) {
     os::Log::write(
@@ -69,6 +76,10 @@ void AXDServer::debug(std::string_view format,
 
 void AXDServer::submitWork(std::function<void()> work) {
   mainQueue_->async(std::move(work));
+}
+
+void AXDServer::submitSetUp(std::function<void()> work) {
+  asio::post(*setUpPool_, std::move(work));
 }
 
 bool AXDServer::holdOnPlugIn(const AXDPlugIn& plugIn) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <asio/thread_pool.hpp>
 #include <atomic>
 #include <cstdint>
 #include <functional>
@@ -19,10 +20,12 @@
 #include "platform/zyn/ThreadQueue.h"
 
 // The daemon's one service object: the plug-in database, the listener on the named service, and
-// the queues that order the daemon's work. New connections arrive on "zyn"; every request is
-// worked on "service", one at a time; "serverSync" guards the holds. Exactly one exists per
-// process; it lives until the process ends. log(), debug() and the hold operations may be called
-// from any thread; each hold operation enters serverSync synchronously and nothing else.
+// the queues that order the daemon's work. New connections arrive on "zyn"; each is set up (its
+// executable, bundle and entitlements read) on a small pool of set-up threads, so a slow one
+// holds up no other client; every request is worked on "service", one at a time; "serverSync"
+// guards the holds. Exactly one exists per process; it lives until the process ends. log(),
+// debug() and the hold operations may be called from any thread; each hold operation enters
+// serverSync synchronously and nothing else.
 class AXDZynClient;
 
 class AXDServer : public AXDatabase, public AXDatabaseDelegate {
@@ -49,6 +52,8 @@ class AXDServer : public AXDatabase, public AXDatabaseDelegate {
 
   // Schedules |work| on the service queue and returns at once.
   void submitWork(std::function<void()> work);
+  // Schedules the set-up of a new client, |work|, on a set-up thread and returns at once.
+  void submitSetUp(std::function<void()> work);
 
   // ---- Holds ----------------------------------------------------------------------------------
 
@@ -90,6 +95,7 @@ class AXDServer : public AXDatabase, public AXDatabaseDelegate {
   const AXDUserPrefs userPrefs_;
   std::shared_ptr<zyn::StrandQueue> zynQueue_;
   std::shared_ptr<zyn::ThreadQueue> mainQueue_;
+  std::unique_ptr<asio::thread_pool> setUpPool_;
   std::shared_ptr<zyn::Listener> service_;
   std::unique_ptr<zyn::SyncQueue> syncQueue_;
   std::vector<std::shared_ptr<AXDPlugInHold>> holds_;  // guarded by syncQueue_

@@ -11,10 +11,15 @@ constexpr std::size_t kExecutablePathBuffer = 2048;
 
 }  // namespace
 
-std::shared_ptr<AXDZynClient> AXDZynClient::initWithConnection(
+void AXDZynClient::initWithConnection(std::shared_ptr<zyn::Connection> connection,
+                                      std::shared_ptr<AXDServer> server) {
+  server->submitSetUp([connection, server] { setUpConnection(connection, server); });
+}
+
+std::shared_ptr<AXDZynClient> AXDZynClient::setUpConnection(
     std::shared_ptr<zyn::Connection> connection, std::shared_ptr<AXDServer> server) {
   std::shared_ptr<AXDZynClient> client(new AXDZynClient(connection, std::move(server)));
-  client->setUp(connection);
+  if (!client->setUp(connection)) return nullptr;
   return client;
 }
 
@@ -22,17 +27,33 @@ AXDZynClient::AXDZynClient(std::shared_ptr<zyn::Connection> connection,
                            std::shared_ptr<AXDServer> server)
     : connection_(connection), server_(std::move(server)) {}
 
-void AXDZynClient::setUp(const std::shared_ptr<zyn::Connection>& connection) {
+bool AXDZynClient::setUp(const std::shared_ptr<zyn::Connection>& connection) {
   std::string path = connection->peerExecutablePath().value_or(std::string());
   if (path.size() >= kExecutablePathBuffer) path.clear();
   if (!path.empty()) bundle_ = AXBundle::initWithExecutableURL(AXFileURL(path));
   server_->debug("client %d %s", {pid(), path});
-  os::Probes::clientNew(pid());
   _task = codesign::Task::fromAuditToken(connection->peerPid(), connection->auditToken());
+  if (!runsProgramOfTask(*connection)) {
+    // An exec between the accept and the reading of the entitlements: they would belong to
+    // another program than the one the connection checks each request against.
+    server_->log("refusing client %d: its program changed while it was set up", {pid()});
+    connection->cancel();
+    return false;
+  }
+  os::Probes::clientNew(pid());
   auto self = shared_from_this();
   connection->setContext(self);
   connection->setEventHandler([self](const zyn::Event& event) { self->handleEvent(event); });
+  // Only now is anything of the client read, so its first request is handled with its
+  // entitlements known.
   connection->resume();
+  return true;
+}
+
+bool AXDZynClient::runsProgramOfTask(const zyn::Connection& connection) const {
+  if (!_task) return true;
+  const auto& accepted = connection.peer().program;
+  return accepted && _task->program() && *accepted == *_task->program();
 }
 
 void AXDZynClient::handleEvent(const zyn::Event& event) {

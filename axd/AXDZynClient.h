@@ -20,12 +20,19 @@ class AXDServer;
 // signing identity. It receives every event of its connection (on the connection's own serial
 // delivery), turns each request into a Transaction for the service queue, and stops accepting
 // work when the connection dies. The connection owns the client; so does each of its queued
-// transactions. requestCount is touched only on the service queue.
+// transactions. The bundle and task are written by set-up, before the connection is resumed, and
+// only read afterwards; requestCount is touched only on the service queue.
 class AXDZynClient : public std::enable_shared_from_this<AXDZynClient> {
  public:
-  // Makes the client for a new connection and resumes the connection.
-  static std::shared_ptr<AXDZynClient> initWithConnection(
-      std::shared_ptr<zyn::Connection> connection, std::shared_ptr<AXDServer> server);
+  // Schedules the set-up of a new connection (setUpConnection()) on a set-up thread of |server|
+  // and returns at once, so the thread that reads every connection never waits for it.
+  static void initWithConnection(std::shared_ptr<zyn::Connection> connection,
+                                 std::shared_ptr<AXDServer> server);
+  // Makes the client for a new connection, reading its executable, bundle and entitlements, then
+  // resumes the connection. Null, and the connection closed, when the peer no longer runs the
+  // program it ran at accept: its entitlements would be another program's.
+  static std::shared_ptr<AXDZynClient> setUpConnection(std::shared_ptr<zyn::Connection> connection,
+                                                       std::shared_ptr<AXDServer> server);
 
   // The peer's process id, asked of the connection at each use; 0 once the connection is gone.
   pid_t pid() const;
@@ -53,7 +60,11 @@ class AXDZynClient : public std::enable_shared_from_this<AXDZynClient> {
  private:
   AXDZynClient(std::shared_ptr<zyn::Connection> connection, std::shared_ptr<AXDServer> server);
 
-  void setUp(const std::shared_ptr<zyn::Connection>& connection);
+  // False when the connection was refused (setUpConnection()).
+  bool setUp(const std::shared_ptr<zyn::Connection>& connection);
+  // True when the entitlements were read for the program the peer ran at accept, or none were
+  // (the process is gone, and the connection will end).
+  bool runsProgramOfTask(const zyn::Connection& connection) const;
   void handleEvent(const zyn::Event& event);
   void handleMessage(const zyn::Message& message);
 

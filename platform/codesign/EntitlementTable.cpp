@@ -12,7 +12,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/os/Digest.h"
+#include "platform/codesign/DigestCache.h"
 #include "platform/os/Format.h"
 #include "platform/os/Log.h"
 #include "platform/os/Paths.h"
@@ -159,7 +159,7 @@ std::optional<value::Dictionary> EntitlementTable::lookup(const std::string& pat
     if (entry.executable != path) continue;
     if (!entry.sha256) return entry.entitlements;
     if (!digested && executableFd >= 0) {
-      auto digest = os::Digest::sha256File(executableFd);
+      auto digest = DigestCache::shared().sha256(executableFd, path);
       if (digest.ok()) imageDigest = digest.value();
     }
     digested = true;

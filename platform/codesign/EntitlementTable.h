@@ -26,7 +26,8 @@ class EntitlementTable {
   // can be read through |executableFd| (-1 when it cannot). The first entry in file-name order
   // whose "Executable" is |path| and, when it has a "SHA256", whose digest equals the image's
   // wins. An entry without "Entitlements" gives an empty dictionary. Nothing when no entry
-  // matches; a "SHA256" entry never matches without a readable image.
+  // matches; a "SHA256" entry never matches without a readable image. The image's digest comes
+  // from DigestCache::shared(), so an image already hashed is not read again.
   std::optional<value::Dictionary> lookup(const std::string& path, int executableFd) const;
 
   // The number of entries taken from the table files.

@@ -1,5 +1,6 @@
 #include "platform/codesign/Task.h"
 
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -9,9 +10,25 @@
 
 namespace codesign {
 
-Task::Task(std::string executablePath, value::Dictionary entitlements,
-           std::optional<os::Error> tableError)
+namespace {
+
+std::optional<os::FileIdentity> identityOf(pid_t pid, int imageFd) {
+  if (imageFd < 0) {
+    auto running = os::Process::executableIdentity(pid);
+    if (!running.ok()) return std::nullopt;
+    return running.value();
+  }
+  struct stat status {};
+  if (fstat(imageFd, &status) != 0) return std::nullopt;
+  return os::FileIdentity{status.st_dev, status.st_ino};
+}
+
+}  // namespace
+
+Task::Task(std::string executablePath, std::optional<os::FileIdentity> program,
+           value::Dictionary entitlements, std::optional<os::Error> tableError)
     : executablePath_(std::move(executablePath)),
+      program_(program),
       entitlements_(std::move(entitlements)),
       tableError_(std::move(tableError)) {}
 
@@ -23,6 +40,7 @@ std::unique_ptr<Task> Task::fromAuditToken(pid_t pid, int pidfd) {
   auto image = os::Process::openExecutable(pid, pidfd);
   if (!image.ok() && image.error().errnum == ESRCH) return nullptr;
   int imageFd = image.ok() ? image.value() : -1;
+  std::optional<os::FileIdentity> program = identityOf(pid, imageFd);
   value::Dictionary entitlements;
   std::optional<os::Error> tableError;
   auto table = EntitlementTable::load();
@@ -33,7 +51,7 @@ std::unique_ptr<Task> Task::fromAuditToken(pid_t pid, int pidfd) {
   }
   if (imageFd >= 0) close(imageFd);
   return std::unique_ptr<Task>(
-      new Task(std::move(path).value(), std::move(entitlements), std::move(tableError)));
+      new Task(std::move(path).value(), program, std::move(entitlements), std::move(tableError)));
 }
 
 std::optional<value::Value> Task::entitlementValue(std::string_view key,

@@ -8,6 +8,7 @@
 #include <string_view>
 
 #include "platform/os/Error.h"
+#include "platform/os/Process.h"
 #include "platform/value/Dictionary.h"
 #include "platform/value/Value.h"
 
@@ -35,12 +36,17 @@ class Task {
 
   // The executable's path as the kernel names it (see os::Process::executablePath).
   const std::string& executablePath() const { return executablePath_; }
+  // The program file whose entitlements these are: the image as opened for its digest, or, when
+  // it could not be opened, the file the process ran just after its path was read. Nothing when
+  // neither could be examined. A connection compares it with the file its peer ran at accept.
+  const std::optional<os::FileIdentity>& program() const { return program_; }
 
  private:
-  Task(std::string executablePath, value::Dictionary entitlements,
-       std::optional<os::Error> tableError);
+  Task(std::string executablePath, std::optional<os::FileIdentity> program,
+       value::Dictionary entitlements, std::optional<os::Error> tableError);
 
   std::string executablePath_;
+  std::optional<os::FileIdentity> program_;
   value::Dictionary entitlements_;
   std::optional<os::Error> tableError_;
 };

@@ -22,10 +22,12 @@ class SelfClient {
     asio::local::stream_protocol::socket socket(zyn::Runtime::shared().context());
     socket.assign(asio::local::stream_protocol(), fds[0]);
     auto pidfd = os::Process::openPidfd(getpid());
-    zyn::PeerCredentials peer{getpid(), getuid(), getgid(), pidfd.ok() ? pidfd.value() : -1};
+    auto program = os::Process::executableIdentity(getpid());
+    zyn::PeerCredentials peer{getpid(), getuid(), getgid(), pidfd.ok() ? pidfd.value() : -1,
+                              program.ok() ? std::optional(program.value()) : std::nullopt};
     auto connection =
         zyn::Connection::accepted(std::move(socket), peer, "self", zyn::FrameLimits{});
-    client_ = AXDZynClient::initWithConnection(connection, AXDServer::server());
+    client_ = AXDZynClient::setUpConnection(connection, AXDServer::server());
   }
   // Closing our end ends the connection, and with it the client.
   ~SelfClient() {

@@ -1,5 +1,6 @@
 // A connection that changes hands: a child that inherited it, another program exec'd in the
-// process that made it, and the children of a client-library host.
+// process that made it, the children of a client-library host, and the reading of a
+// connecting program's image.
 
 #include <fcntl.h>
 #include <sys/socket.h>
@@ -10,10 +11,12 @@
 #include <cstdint>
 #include <cstdio>
 #include <cstring>
+#include <filesystem>
 #include <string>
 #include <vector>
 
 #include "Annexa/AXProtocol.h"
+#include "platform/os/Digest.h"
 #include "tests/e2e/Bundles.h"
 #include "tests/e2e/DaemonTest.h"
 
@@ -149,3 +152,25 @@ TEST_F(PeerTest, ChildOfAHostInheritsNoConnection) {
 }
 
 }  // namespace
+
+// A table entry with a digest makes each set-up check the client's image; it is read once for
+// many connections of the same program, and the entitlements still hold from the first request.
+TEST_F(PeerTest, AProgramWithADigestEntryIsHashedOnceForAllItsConnections) {
+  const std::string self = std::filesystem::canonical("/proc/self/exe").string();
+  auto digest = os::Digest::sha256File(self);
+  ASSERT_TRUE(digest.ok());
+  std::string table = root() + "/etc/annexa/entitlements.d/e2e_tests.plist";
+  bundles::writePlist(table,
+                      Value::dictionary({
+                          {"Executable", Value::string(self)},
+                          {"SHA256", Value::string(digest.value())},
+                          {"Entitlements", Value::dictionary({{kManager, Value::boolean(true)}})},
+                      }));
+  std::filesystem::permissions(table, std::filesystem::perms(0644));
+  for (int connect = 0; connect < 5; ++connect) {
+    BlockingClient fresh;
+    EXPECT_EQ(fresh.outcome(fresh.client().request(AXProtocol::kRemove, {"/no/such.appex"})),
+              "9: no plugin at /no/such.appex");
+  }
+  EXPECT_EQ(logCount("hashing " + self), 1u);
+}

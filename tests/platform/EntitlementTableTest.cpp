@@ -1,3 +1,4 @@
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <spawn.h>
@@ -9,9 +10,11 @@
 #include <cctype>
 #include <cerrno>
 #include <filesystem>
+#include <fstream>
 
 #include "ScopedEnvironment.h"
 #include "TempDirectory.h"
+#include "platform/codesign/DigestCache.h"
 #include "platform/codesign/EntitlementTable.h"
 #include "platform/codesign/Task.h"
 #include "platform/os/Digest.h"
@@ -190,6 +193,24 @@ TEST_F(EntitlementTableTest, AReplacedExecutableIsNotTrusted) {
   ASSERT_TRUE(after);
   EXPECT_EQ(after->executablePath(), tool + " (deleted)");
   EXPECT_FALSE(has(*after, "org.annexa.tool"));
+}
+
+// A digest is remembered per file identity: a file rewritten in place (same inode) is read again.
+TEST_F(EntitlementTableTest, ARewrittenImageIsHashedAgain) {
+  codesign::DigestCache cache;
+  std::string file = root_ / "image";
+  auto digestOf = [&] {
+    int fd = open(file.c_str(), O_RDONLY | O_CLOEXEC);
+    auto digest = cache.sha256(fd, file);
+    close(fd);
+    return digest.ok() ? digest.value() : std::string();
+  };
+  root_.write("image", "first");
+  const std::string first = digestOf();
+  EXPECT_EQ(first, os::Digest::sha256File(file).value());
+  std::ofstream(file, std::ios::trunc) << "second, longer";
+  EXPECT_NE(digestOf(), first);
+  EXPECT_EQ(digestOf(), os::Digest::sha256File(file).value());
 }
 
 }  // namespace
