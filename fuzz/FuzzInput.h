@@ -1,0 +1,36 @@
+#pragma once
+
+// Helpers shared by the fuzz targets that need more than one input from one byte string.
+
+#include <algorithm>
+#include <cstdint>
+#include <span>
+#include <string_view>
+#include <utility>
+
+#include "platform/value/PropertyList.h"
+#include "platform/value/Value.h"
+
+namespace fuzz {
+
+// The separator line between the two parts of a two-part input.
+inline constexpr std::string_view kSeparator = "\n%%\n";
+
+// |bytes| split at the first separator line into what comes before and after it; everything is
+// the first part, and the second is empty, when there is no separator.
+inline std::pair<std::span<const std::uint8_t>, std::span<const std::uint8_t>> splitInput(
+    std::span<const std::uint8_t> bytes) {
+  auto at = std::search(bytes.begin(), bytes.end(), kSeparator.begin(), kSeparator.end());
+  if (at == bytes.end()) return {bytes, {}};
+  auto first = static_cast<std::size_t>(at - bytes.begin());
+  return {bytes.first(first), bytes.subspan(first + kSeparator.size())};
+}
+
+// The property list in |bytes| when it holds a dictionary.
+inline std::optional<value::Dictionary> readDictionary(std::span<const std::uint8_t> bytes) {
+  auto value = value::PropertyList::read(bytes);
+  if (!value.ok() || !value.value().asDictionary()) return std::nullopt;
+  return *value.value().asDictionary();
+}
+
+}  // namespace fuzz
