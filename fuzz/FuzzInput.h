@@ -7,7 +7,9 @@
 #include <span>
 #include <string_view>
 #include <utility>
+#include <vector>
 
+#include "platform/value/CborCodec.h"
 #include "platform/value/PropertyList.h"
 #include "platform/value/Value.h"
 
@@ -31,6 +33,15 @@ inline std::optional<value::Dictionary> readDictionary(std::span<const std::uint
   auto value = value::PropertyList::read(bytes);
   if (!value.ok() || !value.value().asDictionary()) return std::nullopt;
   return *value.value().asDictionary();
+}
+
+// True when |a| and |b| encode to the same bytes. Unlike ==, a NaN is the same as itself.
+inline bool sameValue(const value::Value& a, const value::Value& b) {
+  std::vector<std::uint8_t> first;
+  std::vector<std::uint8_t> second;
+  value::CborCodec::encode(a, first);
+  value::CborCodec::encode(b, second);
+  return first == second;
 }
 
 }  // namespace fuzz

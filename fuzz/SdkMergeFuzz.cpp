@@ -18,6 +18,10 @@ bool holdsEveryKey(const value::Dictionary& merged, const value::Dictionary& sid
   return true;
 }
 
+bool same(const value::Dictionary& a, const value::Dictionary& b) {
+  return fuzz::sameValue(value::Value::dictionary(a), value::Value::dictionary(b));
+}
+
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
@@ -27,8 +31,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   auto manifestSide = fuzz::readDictionary(manifestBytes).value_or(value::Dictionary());
   value::Dictionary merged = sdk::mergeDictionary(*sdkSide, manifestSide);
   if (!holdsEveryKey(merged, *sdkSide) || !holdsEveryKey(merged, manifestSide)) std::abort();
-  if (!(sdk::mergeDictionary(*sdkSide, {}) == *sdkSide)) std::abort();
-  if (!(sdk::mergeDictionary({}, manifestSide) == manifestSide)) std::abort();
+  if (!same(sdk::mergeDictionary(*sdkSide, {}), *sdkSide)) std::abort();
+  if (!same(sdk::mergeDictionary({}, manifestSide), manifestSide)) std::abort();
   value::Dictionary canonical = sdk::canonicalize(merged);
   if (const value::Value* version = canonical.find("QFBundleShortVersionString")) {
     sdk::versionText(*version);

@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <string>
 
+#include "FuzzInput.h"
 #include "platform/launcher/ServiceFile.h"
 
 namespace {
@@ -22,7 +23,9 @@ std::string holding(const void* data, std::size_t size) {
 }
 
 bool same(const launcher::ServiceFile::Contents& a, const launcher::ServiceFile::Contents& b) {
-  return a.executablePath == b.executablePath && a.description == b.description &&
+  return a.executablePath == b.executablePath &&
+         fuzz::sameValue(value::Value::dictionary(a.description),
+                         value::Value::dictionary(b.description)) &&
          a.hostStartTime == b.hostStartTime;
 }
 

@@ -32,6 +32,7 @@ class EntitlementTable {
   // The number of entries taken from the table files.
   std::size_t size() const { return entries_.size(); }
 
+  // One file's entry, as entryFrom reads it.
   struct Entry {
     std::string source;  // the table file, for log lines
     std::string executable;
