@@ -48,7 +48,9 @@ bench: bootstrap
 
 # Each target runs for FUZZ_SECONDS from its committed seeds; new inputs it finds stay in
 # $(FUZZ_BUILD)/corpus/<directory>. `make test` replays the committed seeds (docs/fuzzing.md).
-FUZZ_TARGETS = FrameDecoderFuzz:frame PropertyListFuzz:plist CborCodecFuzz:cbor
+FUZZ_TARGETS = FrameDecoderFuzz:frame PropertyListFuzz:plist CborCodecFuzz:cbor \
+  EntitlementEntryFuzz:entitlements SdkMergeFuzz:sdk ActivationRuleFuzz:activation \
+  ExtensionTokenFuzz:token ServiceFileFuzz:service RecordCodecFuzz:record
 
 fuzz:
 	@scripts/bootstrap --fuzz

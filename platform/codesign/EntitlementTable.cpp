@@ -116,35 +116,32 @@ std::optional<EntitlementTable::Entry> EntitlementTable::readFile(const std::str
     skip(path, file.error().message);
     return std::nullopt;
   }
-  return entryFrom(path, file.value());
-}
-
-std::optional<EntitlementTable::Entry> EntitlementTable::entryFrom(const std::string& path,
-                                                                   const value::Value& file) {
-  const value::Dictionary* dict = file.asDictionary();
-  if (!dict) {
-    skip(path, "not a dictionary");
+  os::Result<Entry> entry = entryFrom(path, file.value());
+  if (!entry.ok()) {
+    skip(path, entry.error().message);
     return std::nullopt;
   }
+  return std::move(entry).value();
+}
+
+os::Result<EntitlementTable::Entry> EntitlementTable::entryFrom(const std::string& source,
+                                                                const value::Value& file) {
+  const value::Dictionary* dict = file.asDictionary();
+  if (!dict) return os::Error{EINVAL, "not a dictionary"};
   const value::Value* executable = dict->find("Executable");
   const std::string* executablePath = executable ? executable->asString() : nullptr;
   if (!executablePath || !executablePath->starts_with('/')) {
-    skip(path, "\"Executable\" is missing or not an absolute path");
-    return std::nullopt;
+    return os::Error{EINVAL, "\"Executable\" is missing or not an absolute path"};
   }
-  Entry entry{path, canonicalExecutable(*executablePath), std::nullopt, {}};
+  Entry entry{source, canonicalExecutable(*executablePath), std::nullopt, {}};
   if (const value::Value* digest = dict->find("SHA256")) {
     const std::string* text = digest->asString();
     entry.sha256 = text ? normalizedDigest(*text) : std::nullopt;
-    if (!entry.sha256) {
-      skip(path, "\"SHA256\" is not 64 hexadecimal digits");
-      return std::nullopt;
-    }
+    if (!entry.sha256) return os::Error{EINVAL, "\"SHA256\" is not 64 hexadecimal digits"};
   }
   if (const value::Value* entitlements = dict->find("Entitlements")) {
     if (!entitlements->asDictionary()) {
-      skip(path, "\"Entitlements\" is not a dictionary");
-      return std::nullopt;
+      return os::Error{EINVAL, "\"Entitlements\" is not a dictionary"};
     }
     entry.entitlements = *entitlements->asDictionary();
   }

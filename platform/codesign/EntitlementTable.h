@@ -33,7 +33,7 @@ class EntitlementTable {
   // The number of entries taken from the table files.
   std::size_t size() const { return entries_.size(); }
 
- private:
+  // One file's entry, as entryFrom reads it.
   struct Entry {
     std::string source;  // the table file, for log lines
     std::string executable;
@@ -41,8 +41,13 @@ class EntitlementTable {
     value::Dictionary entitlements;
   };
 
+  // The entry that the table file |source| holding |file| describes, its executable path made
+  // canonical when it resolves. Fails with EINVAL, saying why, when |file| is not a dictionary
+  // of the shape above. Logs nothing: the caller decides what a bad file costs.
+  static os::Result<Entry> entryFrom(const std::string& source, const value::Value& file);
+
+ private:
   static std::optional<Entry> readFile(const std::string& path);
-  static std::optional<Entry> entryFrom(const std::string& path, const value::Value& file);
 
   std::vector<Entry> entries_;
 };
