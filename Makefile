@@ -50,7 +50,8 @@ bench: bootstrap
 # $(FUZZ_BUILD)/corpus/<directory>. `make test` replays the committed seeds (docs/fuzzing.md).
 FUZZ_TARGETS = FrameDecoderFuzz:frame PropertyListFuzz:plist CborCodecFuzz:cbor \
   EntitlementEntryFuzz:entitlements SdkMergeFuzz:sdk ActivationRuleFuzz:activation \
-  ExtensionTokenFuzz:token ServiceFileFuzz:service RecordCodecFuzz:record
+  ExtensionTokenFuzz:token ServiceFileFuzz:service RecordCodecFuzz:record \
+  AnnotationFileFuzz:annotations MatchRuleFuzz:match RequestDispatchFuzz:dispatch
 
 fuzz:
 	@scripts/bootstrap --fuzz

@@ -299,7 +299,10 @@ void Connection::cancel() {
 
 os::Status Connection::write(FrameKind kind, std::uint64_t id, const value::Value& body) {
   std::vector<std::uint8_t> bytes;
-  encodeFrame(Frame{kind, id, body}, bytes);
+  if (!encodeFrame(Frame{kind, id, body}, bytes)) {
+    return os::Error{EMSGSIZE, os::format("%s too large (4 GiB or more, limit %zu)",
+                                          {kindName(kind), limits_.maxFrameBytes})};
+  }
   // The length field counts what follows its own 4 bytes; the peer refuses more than the limit.
   std::size_t length = bytes.size() - 4;
   if (length > limits_.maxFrameBytes) {

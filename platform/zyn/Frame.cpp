@@ -40,7 +40,7 @@ bool knownKind(std::uint8_t kind) {
 
 }  // namespace
 
-void encodeFrame(const Frame& frame, std::vector<std::uint8_t>& out) {
+bool encodeFrame(const Frame& frame, std::vector<std::uint8_t>& out) {
   std::size_t start = out.size();
   out.resize(start + kHeaderBytes);
   out[start + kLengthBytes] = static_cast<std::uint8_t>(frame.kind);
@@ -48,11 +48,11 @@ void encodeFrame(const Frame& frame, std::vector<std::uint8_t>& out) {
   value::CborCodec::encode(frame.body, out);
   std::size_t length = out.size() - start - kLengthBytes;
   if (length > UINT32_MAX) {
-    os::Log::write(3, os::format("frame %u of %u bytes exceeds the 4 GiB a frame can carry",
-                                 {frame.id, length}));
-    std::abort();
+    out.resize(start);
+    return false;
   }
   putBigEndian(&out[start], length, kLengthBytes);
+  return true;
 }
 
 FrameLimits FrameLimits::fromEnvironment() {

@@ -45,8 +45,9 @@ struct FrameLimits {
 
 // Appends the whole encoded frame to |out|: 4-byte big-endian length N of what follows, the kind
 // byte, the 8-byte big-endian id and the CBOR item (N - 9 bytes). The caller keeps bodies under
-// the peer's limit; a body of 4 GiB or more cannot be framed and aborts the process.
-void encodeFrame(const Frame& frame, std::vector<std::uint8_t>& out);
+// the peer's limit. False, with |out| as it was, when the frame would be 4 GiB or more, which the
+// length field cannot say.
+bool encodeFrame(const Frame& frame, std::vector<std::uint8_t>& out);
 
 // Incremental decoder over one connection's byte stream: the reader writes into prepare()'s
 // space, commits what it read, then takes frames with next() until it yields nothing. Bytes are

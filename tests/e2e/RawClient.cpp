@@ -66,6 +66,10 @@ bool RawClient::sendFrame(zyn::FrameKind kind, std::uint64_t id, const Value& bo
 
 std::string RawClient::request(std::uint64_t id, const Value& body) {
   if (!sendFrame(zyn::FrameKind::Request, id, body)) return "cannot send";
+  return reply(id);
+}
+
+std::string RawClient::reply(std::uint64_t id) {
   for (;;) {
     auto next = decoder_.next();
     if (!next.ok()) return "no reply";

@@ -35,6 +35,8 @@ class RawClient {
   // does when it is the reply to |id|; "no reply" when it is another frame, a bad one or none
   // came.
   std::string request(std::uint64_t id, const value::Value& body);
+  // Reads the next frame and describes it as request() does.
+  std::string reply(std::uint64_t id);
   // The socket, for a child process that is to use the connection.
   int fd() const { return fd_; }
   // True when the daemon closed the connection. Frames that come first are read and dropped.

@@ -2,6 +2,8 @@
 // as bad luck would: through the real daemon, with clients that misbehave or die at the worst
 // moment.
 
+#include <unistd.h>
+
 #include <algorithm>
 #include <chrono>
 #include <filesystem>
@@ -14,6 +16,7 @@
 #include "platform/value/PropertyList.h"
 #include "tests/e2e/Bundles.h"
 #include "tests/e2e/DaemonTest.h"
+#include "tests/platform/TempDirectory.h"
 
 namespace {
 
@@ -169,6 +172,24 @@ TEST_F(TrustTest, PlantedRuntimeFilesAreNotUsed) {
   std::filesystem::permissions(launcher, std::filesystem::perms(0777));
   EXPECT_EQ(send(AXProtocol::kReady, {uuid(plugIn)}).rfind("4: unable to enable plug-in", 0), 0u);
   EXPECT_EQ(logCount("refusing to use it"), 1u);
+}
+
+// A socket directory that others may write: another user could put a socket of theirs where
+// clients look for the daemon's, so the daemon will not serve there.
+TEST_F(TrustTest, TheDaemonRefusesASocketDirectoryOthersMayWrite) {
+  TempDirectory root;
+  std::string sockets = root / "run/zyn";
+  std::filesystem::create_directories(sockets);
+  std::filesystem::permissions(sockets, std::filesystem::perms(0777));
+  Subprocess::Outcome outcome =
+      Subprocess::run(AXD_EXECUTABLE, {}, {{"ANNEXA_ROOT", root.path()}, {"AXD_LOG", "stderr"}});
+  EXPECT_NE(outcome.status, 0);
+  EXPECT_NE(outcome.err.find(sockets + " is owned by uid " + std::to_string(geteuid()) +
+                             " with mode 0777, not uid " + std::to_string(geteuid()) +
+                             " with 0700: refusing to use it"),
+            std::string::npos)
+      << outcome.err;
+  EXPECT_TRUE(std::filesystem::is_empty(sockets));
 }
 
 }  // namespace

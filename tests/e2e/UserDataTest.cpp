@@ -2,13 +2,16 @@
 // written: nothing acknowledged is lost, nothing unsaved is acknowledged, and a file the daemon
 // cannot read is kept, not overwritten.
 
+#include <sys/resource.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <filesystem>
 #include <string>
 #include <vector>
 
 #include "Annexa/AXProtocol.h"
+#include "platform/launcher/ServiceLauncher.h"
 #include "platform/value/PropertyList.h"
 #include "tests/e2e/Bundles.h"
 #include "tests/e2e/DaemonTest.h"
@@ -27,7 +30,8 @@ class UserDataTest : public DaemonTest {
  protected:
   // Registers plug-in |id| through the daemon and returns its UUID.
   value::Uuid install(const std::string& id) {
-    std::string path = bundles::plugIn(root() + "/Applications", "Notes", {.id = id});
+    std::string path =
+        bundles::plugIn(root() + "/Applications", "Notes", {.id = id, .executable = "/bin/true"});
     EXPECT_EQ(send(AXProtocol::kAdd, {path}), "ok");
     return uuid(path);
   }
@@ -52,6 +56,23 @@ class UserDataTest : public DaemonTest {
       if (name.starts_with("Annotations.rejected-")) kept.push_back(entry.path());
     }
     return kept;
+  }
+
+  // The executable the launcher has recorded for |id| for this process; empty when none.
+  static std::string recordedExecutable(const std::string& id) {
+    auto services = launcher::ServiceLauncher::services();
+    if (!services.ok()) return "";
+    for (const auto& service : services.value()) {
+      if (service.host == getpid() && service.bundleIdentifier == id) return service.executablePath;
+    }
+    return "";
+  }
+  // Limits the size of any file the daemon writes to |bytes|, as a full disk would.
+  void limitDaemonWrites(rlim_t bytes) {
+    struct rlimit limit {
+      bytes, RLIM_INFINITY
+    };
+    ASSERT_EQ(prlimit(daemon().pid(), RLIMIT_FSIZE, &limit, nullptr), 0);
   }
 
   TempDirectory home_;
@@ -93,6 +114,34 @@ TEST_F(UserDataTest, AnElectionThatCannotBeSavedIsRefusedAndNotShown) {
   ASSERT_EQ(elect(uuid, 3), "ok");
   EXPECT_EQ(shown("unsaved.tool"), Value::integer(3));
   expectServing();
+}
+
+// The disk refuses the daemon's writes part way (a file-size limit, as a full file system would):
+// the host is told, and what the daemon saved before still loads.
+TEST_F(UserDataTest, AWriteCutShortIsRefusedAndTheSavedFilesStillLoad) {
+  ASSERT_TRUE(start({"-d", file_}));
+  value::Uuid kept = install("saved.tool");
+  value::Uuid later = install("later.tool");
+  ASSERT_EQ(elect(kept, 1), "ok");
+  ASSERT_EQ(send(AXProtocol::kReady, {kept}), "ok");
+  std::string executable = recordedExecutable("saved.tool");
+  ASSERT_FALSE(executable.empty());
+
+  limitDaemonWrites(64);
+  std::string refused = elect(kept, 2);
+  EXPECT_EQ(refused.rfind("4: unable to save annotations: ", 0), 0u) << refused;
+  EXPECT_EQ(send(AXProtocol::kReady, {later}).rfind("4: unable to enable plug-in", 0), 0u);
+  EXPECT_EQ(send(AXProtocol::kReady, {kept}).rfind("4: unable to enable plug-in", 0), 0u);
+  EXPECT_EQ(recordedExecutable("saved.tool"), executable) << "the record was not kept whole";
+  EXPECT_EQ(recordedExecutable("later.tool"), "");
+  for (const auto& entry : std::filesystem::directory_iterator(home_.path())) {
+    EXPECT_EQ(entry.path(), file_) << "a temporary file was left behind";
+  }
+
+  limitDaemonWrites(RLIM_INFINITY);
+  ASSERT_TRUE(restart());
+  EXPECT_EQ(shown("saved.tool"), Value::integer(1));
+  EXPECT_EQ(send(AXProtocol::kReady, {later}), "ok");
 }
 
 TEST_F(UserDataTest, AFifoAtTheAnnotationPathDoesNotStallStartUp) {

@@ -1,4 +1,7 @@
 #include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/resource.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -64,6 +67,31 @@ TEST_F(PreferencesTest, BrokenFilesReadAsNothingAndAreLoggedOncePerChange) {
   ASSERT_TRUE(Preferences::setValue("j", std::nullopt, "d").ok());
   EXPECT_EQ(k(), Value::boolean(true));
   EXPECT_EQ(Preferences::copyValue("j", "d"), std::nullopt);
+}
+
+// A writer whose disk refuses part of the new file (a file-size limit, as a full file system would)
+// is told, and the domain still reads as it was.
+TEST_F(PreferencesTest, AWriteCutShortIsReportedAndTheOldDomainStillLoads) {
+  writeDomain("<dict><key>k</key><integer>1</integer></dict>", false);
+  pid_t child = fork();
+  ASSERT_GE(child, 0);
+  if (child == 0) {
+    signal(SIGXFSZ, SIG_IGN);
+    struct rlimit limit {
+      64, 64
+    };
+    setrlimit(RLIMIT_FSIZE, &limit);
+    os::Status written = Preferences::setValue("k", Value::string(std::string(4096, 'x')), "d");
+    _exit(!written.ok() && written.error().errnum == EFBIG ? 0 : 1);
+  }
+  int status = 0;
+  ASSERT_EQ(waitpid(child, &status, 0), child);
+  EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "the failed write was not reported";
+  EXPECT_EQ(k(), Value::integer(1));
+  EXPECT_EQ(std::distance(std::filesystem::directory_iterator(root_ / directory_),
+                          std::filesystem::directory_iterator()),
+            1)
+      << "a temporary file was left behind";
 }
 
 TEST_F(PreferencesTest, InvalidDomainNamesAreRefused) {
