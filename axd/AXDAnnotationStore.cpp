@@ -57,8 +57,7 @@ value::Dictionary annotationsIn(const std::string& path, const value::Dictionary
       kept.emplace(key, annotation);
       continue;
     }
-    os::Log::write(5,
-                   os::format("skipping annotation \"%@\" of %@: not a dictionary", {key, path}));
+    os::Log::notice("skipping annotation \"%@\" of %@: not a dictionary", {key, path});
   }
   return value::Dictionary(std::move(kept));
 }
@@ -82,8 +81,8 @@ AXDAnnotationStore::AXDAnnotationStore(const char* path)
   if (loadDb(&error)) return;
   if (error->domain() == AXPOSIXErrorDomain && error->code() == ENOENT) return;
   rejected_ = true;
-  os::Log::write(5, os::format("unable to load annotation database:%@ error:%@ (resetting)",
-                               {annotationsURL_, error->description()}));
+  os::Log::notice("unable to load annotation database:%@ error:%@ (resetting)",
+                  {annotationsURL_, error->description()});
 }
 
 std::string AXDAnnotationStore::defaultDatabaseURL() {
@@ -130,8 +129,8 @@ std::optional<AXError> AXDAnnotationStore::setAnnotation(
   std::optional<AXError> error;
   if (saveDb(&error)) return std::nullopt;
   annotations_ = std::move(saved);
-  os::Log::write(5, os::format("unable to save annotations:%@ error:%@",
-                               {annotationsURL_, error->description()}));
+  os::Log::notice("unable to save annotations:%@ error:%@",
+                  {annotationsURL_, error->description()});
   return error;
 }
 
@@ -171,7 +170,7 @@ std::optional<AXError> AXDAnnotationStore::keepRejectedFile() {
     std::string aside = attempt == 0 ? stem : stem + "-" + std::to_string(attempt);
     if (renameat2(AT_FDCWD, annotationsURL_.c_str(), AT_FDCWD, aside.c_str(), RENAME_NOREPLACE) ==
         0) {
-      os::Log::write(5, os::format("kept rejected annotation database as %@", {aside}));
+      os::Log::notice("kept rejected annotation database as %@", {aside});
       break;
     }
     if (errno == ENOENT) break;

@@ -82,10 +82,9 @@ std::shared_ptr<AXDPlugIn> AXDPlugIn::initWithRGData(
                     {url.path(), error->description()});
     return nullptr;
   }
-  std::optional<value::Value> demand = record->pluginKey("QSExtensionHostEntitlement");
-  if (demand && (!demand->asString() || demand->asString()->empty())) {
+  if (record->hostEntitlementDemand() == std::string()) {
     os::Log::notice("plug-in at %@ demands a malformed host entitlement %@: no host may use it",
-                    {url.path(), demand->description()});
+                    {url.path(), record->pluginKey("QSExtensionHostEntitlement")->description()});
   }
   return record;
 }

@@ -125,6 +125,10 @@ class AXDPlugIn : public AXPlugInCore {
   // empty, refuses every host ("the plug-in's host entitlement demand is malformed"; the record
   // logged it when it was built).
   std::optional<std::string> allowForClient(const AXDZynClient& client) const;
+  // What "QSExtensionHostEntitlement" demands of a host: nothing when it is absent, else the
+  // entitlement it names; the empty string when it is present but no string or empty, which no
+  // host can meet.
+  std::optional<std::string> hostEntitlementDemand() const;
   // The consent services granted to the plug-in's containing application, read afresh from the
   // consent store. Empty for a plug-in outside any application, and, after a log line, when the
   // application cannot be opened or the store cannot answer for it.

@@ -6,6 +6,7 @@
 #include <string_view>
 
 #include "Annexa/AXUtilities.h"
+#include "axd/AXDElectionFilter.h"
 #include "axd/AXDPlugIn.h"
 #include "axd/AXDServer.h"
 #include "platform/os/Format.h"
@@ -38,16 +39,12 @@ bool isFalse(const value::Value& v) {
   return v.asBool() == std::optional<bool>(false);
 }
 
-// The election as the rule language reads it: bits 8 to 15 cleared, in decimal.
+// The election as the rule language reads it. Building the record stored any auto-election
+// already, so no entitlement is consulted here.
 std::string electionText(const AXDPlugIn& plugIn) {
-  std::int64_t election = 0;
   auto server = AXDServer::server();
-  std::optional<value::Dictionary> annotation =
-      server ? server->annotationForPlugIn(plugIn) : std::nullopt;
-  if (const value::Value* entry = annotation ? annotation->find("election") : nullptr) {
-    election = entry->integerValue().value_or(0);
-  }
-  return std::to_string(election & ~std::int64_t{0xFF00});
+  return AXDElectionFilter::electionText(
+      server ? server->annotationForPlugIn(plugIn) : std::nullopt, value::Dictionary());
 }
 
 }  // namespace
