@@ -47,17 +47,28 @@ std::optional<AXError> rejection(const std::string& path, const value::Dictionar
   return std::nullopt;
 }
 
-// The annotations of |data|, the "data" table of the file |path|. An entry that is not a
-// dictionary was not written by axd: it is skipped with a log line, so one foreign entry cannot
-// cost the user every election.
+// Why axd could not have written |annotation| itself, or nothing when it could.
+std::optional<std::string> foreignness(const value::Value& annotation) {
+  if (!annotation.asDictionary()) return "not a dictionary";
+  // What the file cannot hold as XML (a NUL in a string of a binary file) would make every
+  // later save fail.
+  os::Result<std::string> xml = value::PropertyList::toXml(annotation);
+  if (!xml.ok()) return xml.error().message;
+  return std::nullopt;
+}
+
+// The annotations of |data|, the "data" table of the file |path|. An entry that axd cannot
+// have written is skipped with a log line, so one foreign entry cannot cost the user every
+// election.
 value::Dictionary annotationsIn(const std::string& path, const value::Dictionary& data) {
   std::map<std::string, value::Value> kept;
   for (const auto& [key, annotation] : data) {
-    if (annotation.asDictionary()) {
+    std::optional<std::string> foreign = foreignness(annotation);
+    if (!foreign) {
       kept.emplace(key, annotation);
       continue;
     }
-    os::Log::notice("skipping annotation \"%@\" of %@: not a dictionary", {key, path});
+    os::Log::notice("skipping annotation \"%@\" of %@: %@", {key, path, *foreign});
   }
   return value::Dictionary(std::move(kept));
 }

@@ -62,12 +62,13 @@ class AXDAnnotationStore {
                                        const AXDPlugIn& plugIn);
 
   // Replaces the table with the one in annotationsURL(), less its entries that are not
-  // dictionaries, each logged as "skipping annotation "<key>" of <path>: not a dictionary". On
-  // failure returns false, leaves the table as it was, fires the db-load probe with the error's
-  // domain and code and, when |error| is not null, stores the error there: ENOENT for a missing
-  // file, EINVAL for a file that is not a property list, whose top level or "data" is not a
-  // dictionary, or that has no "data"; the Annexa error 7 when the integer value of "version" (0
-  // when missing or not a number) is not 16.
+  // dictionaries or that an XML property list cannot hold (a NUL in a string of a binary
+  // file), each logged as "skipping annotation "<key>" of <path>: <why>", the reason being
+  // "not a dictionary" or the writer's error. On failure returns false, leaves the table as it was,
+  // fires the db-load probe with the error's domain and code and, when |error| is not null, stores
+  // the error there: ENOENT for a missing file, EINVAL for a file that is not a property list,
+  // whose top level or "data" is not a dictionary, or that has no "data"; the Annexa error 7 when
+  // the integer value of "version" (0 when missing or not a number) is not 16.
   bool loadDb(std::optional<AXError>* error);
 
   // Writes the table to annotationsURL() as an XML property list, atomically: the new content

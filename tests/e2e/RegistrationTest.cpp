@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <filesystem>
+#include <fstream>
 #include <future>
 #include <string>
 #include <vector>
@@ -193,6 +194,30 @@ TEST_F(RegistrationTest, AForeignAnnotationEntryCostsNoElection) {
                 {"kept.first", Value::dictionary({{"election", Value::integer(1)}})},
                 {"kept.second", Value::dictionary(second.with("election", Value::integer(2)))},
             }));
+}
+
+// A binary file can hold a string with a NUL byte, which the XML the daemon saves cannot: kept,
+// such an entry would make every later save fail.
+TEST_F(RegistrationTest, AnAnnotationTheDaemonCannotSaveIsSkippedAtLoad) {
+  // {"version": 16, "data": {"kept.first": {"election": 1},
+  //                          "nul.inside": {"election": 2, "note": "\u00e9\0b"}}}, binary,
+  // the string in UTF-16 (an ASCII string would be cut at the NUL as it is read).
+  const std::string hex =
+      "62706c6973743030d20102030d54646174615776657273696f6ed2040506095a6b6570742e6669727374"
+      "5a6e756c2e696e73696465d1070858656c656374696f6e1001d2070a0b0c546e6f746510026300e90000"
+      "00621010080d121a1f2a35384143484d4f560000000000000101000000000000000e0000000000000000"
+      "0000000000000058";
+  std::string bytes;
+  for (std::size_t i = 0; i < hex.size(); i += 2) {
+    bytes.push_back(static_cast<char>(std::stoi(hex.substr(i, 2), nullptr, 16)));
+  }
+  std::ofstream(file_, std::ios::binary) << bytes;
+  ASSERT_TRUE(start({"-d", file_}));
+  value::Uuid uuid = install("kept.first");
+  EXPECT_EQ(logCount("skipping annotation \"nul.inside\" of " + file_ +
+                     ": property-list text cannot hold NUL"),
+            1u);
+  EXPECT_EQ(annotate({uuid}, {{"election", Value::integer(3)}}), "ok");
 }
 
 TEST_F(RegistrationTest, WatchSeesTheChanges) {
