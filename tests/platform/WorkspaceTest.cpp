@@ -59,13 +59,13 @@ class WorkspaceTest : public ::testing::Test {
 
 TEST_F(WorkspaceTest, BadBundlesFailAndLeaveTheRegistryUnchanged) {
   registerAt(root_.plugIn("Good.app/PlugIns/P.appex", "p"));
-  root_.writeFile("Malformed.appex/Info.plist", "<plist><dict><key>x</key>");
+  root_.write("Malformed.appex/Info.plist", "<plist><dict><key>x</key>");
   root_.writePlist("WrongExtension.appex/Info.plist",
                    Value::dictionary({{"QSExtension", Value::string("n")}}));
   root_.writePlist("ArrayInfo.appex/Info.plist", Value::array({}));
   root_.plugIn("BadEntitlements.appex", "e");
-  root_.writeFile("BadEntitlements.appex/Entitlements.plist", "garbage");
-  root_.writeFile("File.appex", "not a directory");
+  root_.write("BadEntitlements.appex/Entitlements.plist", "garbage");
+  root_.write("File.appex", "not a directory");
   fs::create_directories(root_ / "Empty.appex");
   std::string before = snapshot();
 
@@ -90,7 +90,7 @@ TEST_F(WorkspaceTest, AFailureInsideTheTransactionRollsBackEarlierWrites) {
   std::string app = root_.application("A.app", "a");
   root_.plugIn("A.app/PlugIns/One.appex", "one");
   fs::remove_all(root_ / "var/containers");
-  root_.writeFile("var/containers", "a file where the containers belong");
+  root_.write("var/containers", "a file where the containers belong");
   std::string before = snapshot();
   EXPECT_EQ(workspace_->installApplication(app).error().errnum, ENOTDIR);
   EXPECT_EQ(workspace_->registerPlugIn(root_ / "A.app/PlugIns/One.appex").error().errnum, ENOTDIR);
@@ -101,7 +101,7 @@ TEST_F(WorkspaceTest, AFailureInsideTheTransactionRollsBackEarlierWrites) {
 TEST_F(WorkspaceTest, PlaceholdersAreHiddenUntilFinishedAndUninstallTakesThePlugIns) {
   std::string app = root_.application("Beta.app", "beta");
   root_.plugIn("Beta.app/PlugIns/One.appex", "one");
-  root_.writeFile("Beta.app/PlugIns/README", "not a bundle");
+  root_.write("Beta.app/PlugIns/README", "not a bundle");
   auto installed =
       workspace_->installApplication(app, {.placeholder = true, .dataContainer = false});
   ASSERT_TRUE(installed.ok()) << installed.error().message;
@@ -173,7 +173,7 @@ TEST_F(WorkspaceTest, ReopeningKeepsRecordsMigratesAnOldSchemaAndSetsAForeignOne
     EXPECT_TRUE(fresh.value()->listPlugIns().value().empty());
     EXPECT_EQ(setAside(root_ / "var/db"), 1u) << sql;
   }
-  EXPECT_EQ(Workspace::open(root_.writeFile("file", "x")).error().errnum, ENOTDIR);
+  EXPECT_EQ(Workspace::open(root_.write("file", "x")).error().errnum, ENOTDIR);
 }
 
 }  // namespace
