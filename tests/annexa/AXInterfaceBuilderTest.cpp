@@ -75,34 +75,6 @@ TEST_F(AXInterfaceBuilder, AFailureStopsAtItsEntryAndKeepsTheEarlierOnes) {
   EXPECT_EQ(text.find(line), text.rfind(line));  // logged once
 }
 
-TEST_F(AXInterfaceBuilder, AMissingProtocolIsLoggedAndReportedWithCode12) {
-  EXPECT_TRUE(AXLookUpProtocol("QSObject"));  // the root protocol exists without being added
-
-  LogCapture log;
-  std::optional<AXError> error;
-  EXPECT_EQ(AXLookUpProtocol("Absent", &error), nullptr);
-  const std::string message =
-      "unable to locate protocol \"Absent\" - check that it is defined and not inadvertently "
-      "optimized away";
-  ASSERT_TRUE(error);
-  EXPECT_EQ(error->code(), 12);
-  EXPECT_EQ(error->localizedDescription(), message);
-  EXPECT_NE(log.text().find(message), std::string::npos);
-
-  // In a compound, an element that is no name is missing under its description.
-  error.reset();
-  EXPECT_EQ(AXProtocolFromSpec(A({S("ToolProtocol"), I(7)}), &error), nullptr);
-  ASSERT_TRUE(error);
-  EXPECT_EQ(error->code(), 12);
-  EXPECT_NE(log.text().find("unable to locate protocol \"7\""), std::string::npos);
-
-  // A value that is neither a name nor a list names nothing, and that is no error.
-  error.reset();
-  EXPECT_EQ(AXProtocolFromSpec(I(5), &error), nullptr);
-  EXPECT_EQ(AXProtocolFromSpec(value::Value(), &error), nullptr);
-  EXPECT_FALSE(error);
-}
-
 TEST_F(AXInterfaceBuilder, AHalfMadeCompoundIsMadeAgainUnderTheSameName) {
   // The missing protocol is registered half-way, so each run of this test needs a name of its own.
   static int run = 0;

@@ -10,45 +10,6 @@
 namespace {
 
 using namespace fixtures;
-using value::Value;
-
-TEST(AXPlugInCoreDerived, OnlyAppExtensionsDefaultToQSObject) {
-  auto appex = record(kAppexPath, manifest(D({})));
-  EXPECT_TRUE(appex->isAppExtension());
-  EXPECT_EQ(appex->protocolSpec(), S("QSObject"));
-  EXPECT_EQ(appex->principalSpec(), S("QSObject"));
-  EXPECT_EQ(appex->embeddedProtocolSpec(), S("QSObject"));
-
-  // The suffix is case-sensitive.
-  for (const char* path : {kBundlePath, "/Apps/Tool.APPEX"}) {
-    auto other = record(path, manifest(D({})));
-    EXPECT_FALSE(other->isAppExtension()) << path;
-    EXPECT_FALSE(other->protocolSpec()) << path;
-    EXPECT_FALSE(other->principalSpec()) << path;
-    EXPECT_FALSE(other->embeddedProtocolSpec()) << path;
-  }
-}
-
-TEST(AXPlugInCoreDerived, DataDedicatedAndOldStyleFlags) {
-  auto protocol = [](Value spec) {
-    return record(kBundlePath, manifest(D({{"QSExtensionProtocol", spec}})))->isData();
-  };
-  EXPECT_TRUE(protocol(S("#Data")));
-  EXPECT_FALSE(protocol(S("Data")));
-  EXPECT_FALSE(protocol(A({S("#Data")})));
-  EXPECT_FALSE(record(kAppexPath, manifest(D({})))->isData());
-
-  auto dedicated = [](std::optional<Value> flag) {
-    value::Dictionary plugIn;
-    if (flag) plugIn = plugIn.with("Dedicated", *flag);
-    return record(kBundlePath, manifest(Value::dictionary(plugIn)))->isDedicated();
-  };
-  EXPECT_FALSE(dedicated(std::nullopt));
-  EXPECT_TRUE(dedicated(B(true)));
-  EXPECT_FALSE(dedicated(I(0)));
-  EXPECT_FALSE(dedicated(S("yes")));
-}
-
 // One writer changes annotations and names while readers check that every value they see is
 // one that a writer stored whole. Run under the sanitizers, this also checks the locking.
 TEST(AXPlugInCoreConcurrency, ReadersSeeWholeValuesWhileAWriterWrites) {

@@ -71,22 +71,6 @@ class AXDPlugInPolicyTest : public ::testing::Test {
   std::shared_ptr<AXDServer> server_;
 };
 
-TEST_F(AXDPlugInPolicyTest, TheElectionIsMatchedWithoutItsSecondByte) {
-  const struct {
-    std::optional<std::int64_t> stored;
-    const char* text;
-  } cases[] = {{std::nullopt, "0"}, {1, "1"}, {257, "1"}, {256, "0"}, {65537, "65537"}};
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.text);
-    auto plugIn = record("policy.election." + std::to_string(c.stored.value_or(-1)));
-    if (c.stored)
-      server_->setAnnotation(Dictionary{{"election", Value::integer(*c.stored)}}, *plugIn);
-    EXPECT_TRUE(plugIn->matchKey("QSUserElection", S(c.text)));
-    EXPECT_TRUE(plugIn->match(Dictionary{{"QSUserElection", A({S("7"), S(c.text)})}}));
-    EXPECT_FALSE(plugIn->matchKey("QSUserElection", S(std::string("9") + c.text)));
-  }
-}
-
 TEST_F(AXDPlugInPolicyTest, TheFirstRefusalWins) {
   const std::string restricted = "the host's plug-in entitlement does not allow this plug-in";
   const std::string invalid = "invalid host restriction entitlement";

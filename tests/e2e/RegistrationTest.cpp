@@ -84,8 +84,8 @@ TEST_F(RegistrationTest, RemoveNeedsTheManagerEntitlement) {
             "9: no plugin at /does/not/exist.appex");
 }
 
-// What the daemon does on an uninstall is tested in-process; here, that the registry's notice
-// reaches it from another process.
+// What the daemon does on an uninstall is in UseTest; here, that the registry's notice reaches
+// it from another process.
 TEST_F(RegistrationTest, AnUninstallByAnotherProcessReachesTheDaemon) {
   ASSERT_TRUE(start());
   ASSERT_EQ(send(AXProtocol::kAdd, {bundle("Widgets", "widget.one")}), "ok");

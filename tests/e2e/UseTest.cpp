@@ -165,6 +165,32 @@ TEST_F(UseTest, EnablingRegistersTheServiceDescriptionWithTheLauncher) {
 
 // The host policy is tested in-process; here, that ready applies it and holds, and enables only
 // once every plug-in passed.
+// An uninstall by another process takes the plug-in out of discovery and out of the launcher's
+// table; its election comes back with it.
+TEST_F(UseTest, AnUninstalledPlugInIsWithdrawnAndKeepsItsElection) {
+  ASSERT_TRUE(start());
+  std::string path = install("Gone", {.id = "gone.tool"});
+  Uuid before = uuid(path);
+  ASSERT_EQ(send(AXProtocol::kReady, {before}), "ok");
+  auto annotate = client().client().request(AXProtocol::kAnnotate, {before}, 0);
+  annotate[AXProtocol::kAnnotations] = Value::dictionary({{"election", Value::integer(7)}});
+  ASSERT_EQ(client().outcome(annotate), "ok");
+  ASSERT_EQ(enabled().count("gone.tool"), 1u);
+
+  auto registry = registrum::Workspace::open(root());
+  ASSERT_TRUE(registry.ok());
+  ASSERT_TRUE(registry.value()->uninstallApplication(root() + "/Applications/Gone.app").ok());
+  ASSERT_TRUE(daemon().waitForLog("UNINSTALLED:gone.tool gone.tool(1.0)"));
+  // The withdrawal runs on the service queue, so a request served after it sees it done.
+  EXPECT_EQ(client().bulk(0), "ok");
+  EXPECT_EQ(enabled().count("gone.tool"), 0u);
+  EXPECT_EQ(matchIds(), std::vector<std::string>{});
+
+  ASSERT_EQ(send(AXProtocol::kAdd, {path}), "ok");
+  EXPECT_EQ(matchIds(Value::dictionary({{"QSUserElection", Value::string("7")}})),
+            std::vector<std::string>{"gone.tool"});
+}
+
 TEST_F(UseTest, ReadyChecksEveryPlugInBeforeEnablingAny) {
   ASSERT_TRUE(start());
   Uuid first = uuid(install("Host", {.id = "ready.first"}));

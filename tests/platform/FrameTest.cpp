@@ -7,7 +7,6 @@
 
 namespace {
 
-using value::Dictionary;
 using value::Value;
 using zyn::Frame;
 using zyn::FrameDecoder;
@@ -29,23 +28,6 @@ std::vector<std::uint8_t> encoded(const Frame& frame) {
 void feed(FrameDecoder& decoder, const std::uint8_t* bytes, std::size_t n) {
   std::memcpy(decoder.prepare(n), bytes, n);
   decoder.commit(n);
-}
-
-// Every frame the decoder yields until it needs more bytes; fails the test on an error.
-std::vector<Frame> drain(FrameDecoder& decoder) {
-  std::vector<Frame> frames;
-  for (;;) {
-    auto next = decoder.next();
-    EXPECT_TRUE(next.ok()) << next.error().message;
-    if (!next.ok() || !next.value()) return frames;
-    frames.push_back(std::move(*next.value()));
-  }
-}
-
-void expectSame(const Frame& a, const Frame& b) {
-  EXPECT_EQ(a.kind, b.kind);
-  EXPECT_EQ(a.id, b.id);
-  EXPECT_EQ(a.body, b.body);
 }
 
 std::vector<std::uint8_t> header(std::uint32_t length, std::uint8_t kind) {
@@ -70,48 +52,6 @@ os::Error errorAfter(const std::vector<std::uint8_t>& bytes, zyn::FrameLimits li
   auto next = decoder.next();
   EXPECT_FALSE(next.ok());
   return next.ok() ? os::Error{} : next.error();
-}
-
-TEST(FrameTest, LayoutIsLengthKindIdItem) {
-  std::vector<std::uint8_t> bytes = encoded(bulkRequest(0x0102030405060708));
-  ASSERT_GE(bytes.size(), 13u);
-  std::uint32_t length = bytes[0] << 24 | bytes[1] << 16 | bytes[2] << 8 | bytes[3];
-  EXPECT_EQ(length, bytes.size() - 4);
-  EXPECT_EQ(bytes[4], 1);
-  EXPECT_EQ(std::vector<std::uint8_t>(bytes.begin() + 5, bytes.begin() + 13),
-            (std::vector<std::uint8_t>{1, 2, 3, 4, 5, 6, 7, 8}));
-  EXPECT_EQ(bytes[13], 0xA3);  // a map of three entries
-}
-
-TEST(FrameTest, FramesSplitAtEveryByteBoundaryDecode) {
-  std::vector<std::uint8_t> stream = encoded(bulkRequest(1));
-  Frame reply{FrameKind::Reply, UINT64_MAX, Value::dictionary({})};
-  zyn::encodeFrame(reply, stream);
-  for (std::size_t split = 0; split <= stream.size(); ++split) {
-    FrameDecoder decoder;
-    feed(decoder, stream.data(), split);
-    std::vector<Frame> frames = drain(decoder);
-    feed(decoder, stream.data() + split, stream.size() - split);
-    for (Frame& f : drain(decoder)) frames.push_back(std::move(f));
-    ASSERT_EQ(frames.size(), 2u) << "split at " << split;
-    expectSame(frames[0], bulkRequest(1));
-    expectSame(frames[1], reply);
-  }
-}
-
-TEST(FrameTest, LargeFramesArriveInChunks) {
-  Frame big{FrameKind::OneWay, 9, Value::data(value::Data(3u << 20, 0xAB))};
-  std::vector<std::uint8_t> stream = encoded(big);
-  zyn::encodeFrame(bulkRequest(10), stream);
-  FrameDecoder decoder;
-  std::vector<Frame> frames;
-  for (std::size_t at = 0; at < stream.size(); at += 65536) {
-    feed(decoder, stream.data() + at, std::min<std::size_t>(65536, stream.size() - at));
-    for (Frame& f : drain(decoder)) frames.push_back(std::move(f));
-  }
-  ASSERT_EQ(frames.size(), 2u);
-  expectSame(frames[0], big);
-  expectSame(frames[1], bulkRequest(10));
 }
 
 TEST(FrameTest, BrokenFramesAreRefusedAndStayBroken) {

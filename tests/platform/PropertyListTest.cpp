@@ -108,21 +108,6 @@ TEST(PropertyListTest, BinaryReadsWithDatesConverted) {
   EXPECT_EQ(d.find("after")->asDate()->seconds, 978393600.25);
 }
 
-TEST(PropertyListTest, XmlTextReadsBackAsWritten) {
-  Value value = Value::dictionary({
-      {"a", Value::array({Value::integer(INT64_MIN), Value::unsignedInteger(3), Value::real(-2.5),
-                          Value::boolean(false)})},
-      {"d", Value::dictionary({{"data", Value::data({0xFF})}, {"s", Value::string("<&>")}})},
-      {"t", Value::date({0})},
-  });
-  auto xml = PropertyList::toXml(value);
-  ASSERT_TRUE(xml.ok()) << xml.error().message;
-  EXPECT_NE(xml.value().find("<date>1970-01-01T00:00:00Z</date>"), std::string::npos);
-  auto back = PropertyList::read(bytesOf(xml.value()));
-  ASSERT_TRUE(back.ok()) << back.error().message;
-  EXPECT_EQ(back.value(), value);
-}
-
 TEST(PropertyListTest, ValuesWithoutPropertyListFormAreNotWritten) {
   const Value refused[] = {
       Value::uuid(value::Uuid()),

@@ -1,7 +1,5 @@
 #pragma once
 
-#include <filesystem>
-#include <fstream>
 #include <string>
 
 #include "platform/value/PropertyList.h"
@@ -9,22 +7,13 @@
 #include "tests/platform/TempDirectory.h"
 
 // A device root for registry tests, with helpers that lay out bundles and SDK dictionaries.
-class RegistryFixture {
+class RegistryFixture : public TempDirectory {
  public:
-  const std::string& root() const { return dir_.path(); }
-  std::string operator/(const std::string& relative) const { return dir_ / relative; }
+  const std::string& root() const { return path(); }
 
   // Writes |plist| as XML to |relative|, creating its directories; returns the path.
   std::string writePlist(const std::string& relative, const value::Value& plist) const {
-    return writeFile(relative, value::PropertyList::toXml(plist).value());
-  }
-
-  // Writes raw |contents| to |relative|, creating its directories; returns the path.
-  std::string writeFile(const std::string& relative, const std::string& contents) const {
-    std::string path = dir_ / relative;
-    std::filesystem::create_directories(std::filesystem::path(path).parent_path());
-    std::ofstream(path, std::ios::binary | std::ios::trunc) << contents;
-    return path;
+    return write(relative, value::PropertyList::toXml(plist).value());
   }
 
   // A plug-in bundle at |relative| with identifier |id| serving |point|; returns its path.
@@ -39,7 +28,7 @@ class RegistryFixture {
                            {"QFBundleDisplayName", value::Value::string("Display")},
                            {"QSExtension", value::Value::dictionary(plugInDictionary)}};
     writePlist(relative + "/Info.plist", value::Value::dictionary(info));
-    return dir_ / relative;
+    return *this / relative;
   }
 
   // An application bundle at |relative| with identifier |id|; returns its path.
@@ -47,9 +36,6 @@ class RegistryFixture {
     value::Dictionary info{{"QFBundleIdentifier", value::Value::string(id)},
                            {"QFBundleName", value::Value::string("App")}};
     writePlist(relative + "/Info.plist", value::Value::dictionary(info));
-    return dir_ / relative;
+    return *this / relative;
   }
-
- private:
-  TempDirectory dir_;
 };

@@ -19,7 +19,7 @@ class SdkRegistryTest : public ::testing::Test {
 };
 
 TEST_F(SdkRegistryTest, MissingBrokenAndRefusedAreNothing) {
-  root_.writeFile("System/Library/SDKs/broken.plist", "<plist><dict>");
+  root_.write("System/Library/SDKs/broken.plist", "<plist><dict>");
   root_.writePlist("System/Library/SDKs/array.plist", Value::array({}));
   root_.writePlist("System/Library/SDKs/.hidden.plist", Value::dictionary(kSdk));
   root_.writePlist("System/Library/SDKs/a/b.plist", Value::dictionary(kSdk));

@@ -28,9 +28,11 @@ class TempDirectory {
 
   std::string operator/(const std::string& relative) const { return path_ + "/" + relative; }
 
-  // Writes |contents| to |relative| (its directory must exist) and returns the file's path.
+  // Writes |contents| to |relative|, creating its directories, and returns the file's path.
   std::string write(const std::string& relative, const std::string& contents) const {
     std::string file = *this / relative;
+    std::error_code ignored;
+    std::filesystem::create_directories(std::filesystem::path(file).parent_path(), ignored);
     std::ofstream(file, std::ios::binary | std::ios::trunc) << contents;
     return file;
   }

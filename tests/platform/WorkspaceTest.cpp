@@ -11,7 +11,6 @@ namespace {
 
 using registrum::PlugInRecord;
 using registrum::Workspace;
-using value::Dictionary;
 using value::Value;
 
 namespace fs = std::filesystem;
@@ -58,29 +57,15 @@ class WorkspaceTest : public ::testing::Test {
   std::shared_ptr<Workspace> workspace_;
 };
 
-// A folder whose name only starts like the system volume's is not on it; a plug-in named by
-// "QSExtensionIdentifier" keeps its bundle identifier apart.
-TEST_F(WorkspaceTest, IdentifiersAndLocations) {
-  auto system = registerAt(root_.plugIn("System/Library/PlugIns/Tool.appex", "tool"));
-  auto lookalike = registerAt(root_.plugIn("Systemic/Tool.appex", "tool2"));
-  auto named = registerAt(root_.plugIn("Bare.app/PlugIns/Named.appex", "bundle.id", "pt",
-                                       {{"QSExtensionIdentifier", Value::string("plugin.id")}}));
-  ASSERT_TRUE(system && lookalike && named);
-  EXPECT_TRUE(system->onSystemPartition());
-  EXPECT_FALSE(lookalike->onSystemPartition());
-  EXPECT_EQ(named->plugInIdentifier(), "plugin.id");
-  EXPECT_EQ(named->bundleIdentifier(), "bundle.id");
-}
-
 TEST_F(WorkspaceTest, BadBundlesFailAndLeaveTheRegistryUnchanged) {
   registerAt(root_.plugIn("Good.app/PlugIns/P.appex", "p"));
-  root_.writeFile("Malformed.appex/Info.plist", "<plist><dict><key>x</key>");
+  root_.write("Malformed.appex/Info.plist", "<plist><dict><key>x</key>");
   root_.writePlist("WrongExtension.appex/Info.plist",
                    Value::dictionary({{"QSExtension", Value::string("n")}}));
   root_.writePlist("ArrayInfo.appex/Info.plist", Value::array({}));
   root_.plugIn("BadEntitlements.appex", "e");
-  root_.writeFile("BadEntitlements.appex/Entitlements.plist", "garbage");
-  root_.writeFile("File.appex", "not a directory");
+  root_.write("BadEntitlements.appex/Entitlements.plist", "garbage");
+  root_.write("File.appex", "not a directory");
   fs::create_directories(root_ / "Empty.appex");
   std::string before = snapshot();
 
@@ -100,26 +85,12 @@ TEST_F(WorkspaceTest, BadBundlesFailAndLeaveTheRegistryUnchanged) {
   EXPECT_EQ(snapshot(), before);
 }
 
-TEST_F(WorkspaceTest, FailedInstallsLeaveTheRegistryUnchanged) {
-  std::string app = root_.application("A.app", "a");
-  root_.plugIn("A.app/PlugIns/One.appex", "one");
-  ASSERT_TRUE(workspace_->installApplication(app).ok());
-  fs::create_directories(root_ / "NoInfo.app");
-  fs::create_directories(root_ / "NotAnApp");
-  std::string before = snapshot();
-
-  EXPECT_EQ(workspace_->installApplication(app).error().errnum, EEXIST);
-  EXPECT_EQ(workspace_->installApplication(root_ / "NoInfo.app").error().errnum, ENOENT);
-  EXPECT_EQ(workspace_->installApplication(root_ / "NotAnApp").error().errnum, EINVAL);
-  EXPECT_EQ(snapshot(), before);
-}
-
 TEST_F(WorkspaceTest, AFailureInsideTheTransactionRollsBackEarlierWrites) {
   registerAt(root_.plugIn("Kept.appex", "kept"));
   std::string app = root_.application("A.app", "a");
   root_.plugIn("A.app/PlugIns/One.appex", "one");
   fs::remove_all(root_ / "var/containers");
-  root_.writeFile("var/containers", "a file where the containers belong");
+  root_.write("var/containers", "a file where the containers belong");
   std::string before = snapshot();
   EXPECT_EQ(workspace_->installApplication(app).error().errnum, ENOTDIR);
   EXPECT_EQ(workspace_->registerPlugIn(root_ / "A.app/PlugIns/One.appex").error().errnum, ENOTDIR);
@@ -130,7 +101,7 @@ TEST_F(WorkspaceTest, AFailureInsideTheTransactionRollsBackEarlierWrites) {
 TEST_F(WorkspaceTest, PlaceholdersAreHiddenUntilFinishedAndUninstallTakesThePlugIns) {
   std::string app = root_.application("Beta.app", "beta");
   root_.plugIn("Beta.app/PlugIns/One.appex", "one");
-  root_.writeFile("Beta.app/PlugIns/README", "not a bundle");
+  root_.write("Beta.app/PlugIns/README", "not a bundle");
   auto installed =
       workspace_->installApplication(app, {.placeholder = true, .dataContainer = false});
   ASSERT_TRUE(installed.ok()) << installed.error().message;
@@ -149,44 +120,6 @@ TEST_F(WorkspaceTest, PlaceholdersAreHiddenUntilFinishedAndUninstallTakesThePlug
   EXPECT_FALSE(workspace_->applicationAtPath(app).value());
   EXPECT_FALSE(workspace_->plugInForUuid(within[0]->uuid()).value());
   EXPECT_EQ(workspace_->uninstallApplication(app).error().errnum, ENOENT);
-}
-
-TEST_F(WorkspaceTest, QueryPreselectsPlainStringsAndHonoursTheFilter) {
-  root_.plugIn("A.appex", "a", "point.one");
-  root_.writePlist("A.appex/Entitlements.plist",
-                   Value::dictionary({{"grant", Value::string("yes")}}));
-  registerAt(root_ / "A.appex");
-  registerAt(root_.plugIn("B.appex", "b", "point.two"));
-  root_.writePlist("NoPoint.appex/Info.plist",
-                   Value::dictionary({{"QFBundleIdentifier", Value::string("c")},
-                                      {"QSExtension", Value::dictionary({})}}));
-  registerAt(root_ / "NoPoint.appex");
-  root_.plugIn("Attr.appex", "d", "point.two",
-               {{"QSExtensionAttributes",
-                 Value::dictionary({{"QSExtensionPointIdentifier", Value::string("point.one")}})}});
-  registerAt(root_ / "Attr.appex");
-  auto identifiers = [&](const Dictionary& rule, const Workspace::Filter& filter = nullptr) {
-    std::string out;
-    auto records = workspace_->query(rule, filter).value();
-    for (const auto& record : records) {
-      out += record->plugInIdentifier().value_or("?");
-    }
-    return out;
-  };
-  EXPECT_EQ(identifiers({}), "adbc");
-  EXPECT_EQ(identifiers({{"QSExtensionIdentifier", Value::string("b")}}), "b");
-  EXPECT_EQ(identifiers({{"QSExtensionIdentifier", Value::string("=b")}}), "b");
-  EXPECT_EQ(identifiers({{"QSExtensionIdentifier", Value::string("<>b")}}), "adbc");
-  // The attribute is what a rule sees, and plug-ins without an extension point stay candidates.
-  EXPECT_EQ(identifiers({{"QSExtensionPointIdentifier", Value::string("point.one")}}), "adc");
-
-  std::vector<std::string> seen;
-  auto filter = [&](const std::string& identifier, const Dictionary& entitlements) {
-    seen.push_back(identifier + (entitlements.find("grant") ? "+" : ""));
-    return identifier != "b";
-  };
-  EXPECT_EQ(identifiers({}, filter), "adc");
-  EXPECT_EQ(seen, (std::vector<std::string>{"a+", "d", "b", "c"}));
 }
 
 // How many registry databases were kept aside in |directory|, removing them.
@@ -240,7 +173,7 @@ TEST_F(WorkspaceTest, ReopeningKeepsRecordsMigratesAnOldSchemaAndSetsAForeignOne
     EXPECT_TRUE(fresh.value()->listPlugIns().value().empty());
     EXPECT_EQ(setAside(root_ / "var/db"), 1u) << sql;
   }
-  EXPECT_EQ(Workspace::open(root_.writeFile("file", "x")).error().errnum, ENOTDIR);
+  EXPECT_EQ(Workspace::open(root_.write("file", "x")).error().errnum, ENOTDIR);
 }
 
 }  // namespace

@@ -124,21 +124,6 @@ TEST_F(AXDAnnotationStoreTest, APlugInThatReplacesAnotherSharesItsEntry) {
   EXPECT_FALSE(store.annotationForIdentifier("com.example.newtool"));
 }
 
-TEST_F(AXDAnnotationStoreTest, SavesIntoAMissingDirectoryFailAndCreateNothing) {
-  const std::string missing = directory_ / "missing/Annotations";
-  auto tool = plugIn("tool");
-  LogCapture log;
-  AXDAnnotationStore store(missing.c_str());
-  EXPECT_TRUE(store.setAnnotation(Dictionary{{"election", I(1)}}, *tool));
-  EXPECT_NE(
-      log.text().find("unable to save annotations:" + missing + " error:Error Domain=POSIX Code=2"),
-      std::string::npos)
-      << log.text();
-  EXPECT_EQ(log.text().find("unable to load"), std::string::npos);
-  EXPECT_FALSE(std::filesystem::exists(directory_ / "missing"));
-  EXPECT_EQ(store.annotationForPlugIn(*tool), std::nullopt) << "an unsaved change is undone";
-}
-
 // A writer killed at any moment leaves the old file or the new one: a fresh store always loads
 // whatever is there.
 TEST_F(AXDAnnotationStoreTest, AKilledWriterNeverLeavesAPartialFile) {

@@ -19,7 +19,6 @@ using registrum::PlugInRecord;
 using value::Value;
 
 constexpr std::uint64_t kVersions = AXProtocol::kDiscoverAllVersions;
-constexpr std::uint64_t kCopies = AXProtocol::kDiscoverAllCopies;
 
 struct Copy {
   std::string identifier = "t";
@@ -79,32 +78,6 @@ class AXDMatchListTest : public ::testing::Test {
 };
 
 using Labels = std::vector<std::int64_t>;
-
-TEST_F(AXDMatchListTest, FlagsDecideWhichVersionsAndCopiesStay) {
-  const Labels first{0}, second{1}, both{0, 1};
-  // All copies means nothing without all versions.
-  const struct {
-    std::uint64_t flags;
-    const char* version;  // of the second, later-modified copy; the first has 1.9
-    Labels expected;
-  } cases[] = {
-      {0, "1.8", first},
-      {0, "1.9", second},
-      {0, "1.10", second},
-      {kCopies, "1.9", second},
-      {kVersions, "1.8", both},
-      {kVersions, "1.9", second},
-      {kVersions | kCopies, "1.9", both},
-  };
-  for (const auto& c : cases) {
-    SCOPED_TRACE(std::to_string(c.flags) + " " + c.version);
-    EXPECT_EQ(labels(discover(c.flags, {{}, {.version = c.version, .modified = 1}})), c.expected);
-  }
-  // Other identifiers, even in another case, and a missing version, which is the lowest.
-  EXPECT_EQ(labels(discover(0, {{}, {.identifier = "T"}})), both);
-  EXPECT_EQ(labels(discover(0, {{.version = std::nullopt}, {.version = "0"}})), second);
-  EXPECT_EQ(labels(discover(0, {{.version = "0"}, {.version = std::nullopt}})), first);
-}
 
 TEST_F(AXDMatchListTest, CopiesOfOneVersionPreferTheSystemThenTheLaterTime) {
   const struct {

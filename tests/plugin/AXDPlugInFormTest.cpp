@@ -86,36 +86,7 @@ TEST_F(AXDPlugInFormTest, AResourceThatCannotBeSharedOrLiesOutsideTheBundleIsLef
       << log.text();
 }
 
-class AXDPlugInEntitlementTest : public ::testing::Test {
- protected:
-  static std::shared_ptr<AXDPlugIn> withEntitlements(value::Dictionary entitlements) {
-    PlugInRecord::Fields fields = plugIn("/Apps/Host.app/PlugIns/Tool.appex");
-    fields.containingApplication = application("/Apps/Host.app");
-    fields.entitlements = std::move(entitlements);
-    return build(fields);
-  }
-};
-
-TEST_F(AXDPlugInEntitlementTest, AnEntitlementIsHeldWhenPresentAndNotFalse) {
-  auto record = withEntitlements({
-      {"no", value::Value::boolean(false)},
-      {"yes", value::Value::boolean(true)},
-      {"text", S("")},
-      {"zero", value::Value::integer(0)},
-      {"half", value::Value::real(0.5)},
-  });
-  ASSERT_TRUE(record);
-  for (const char* refused : {"absent", "no", "zero"}) {
-    EXPECT_FALSE(record->hasEntitlement(refused)) << refused;
-  }
-  for (const char* held : {"yes", "text", "half"}) {
-    EXPECT_TRUE(record->hasEntitlement(held)) << held;
-  }
-  EXPECT_EQ(record->valueForEntitlement("text"), S(""));
-  EXPECT_FALSE(record->valueForEntitlement("absent"));
-}
-
-class AXDPlugInNameTest : public AXDPlugInEntitlementTest {
+class AXDPlugInNameTest : public ::testing::Test {
  protected:
   static std::shared_ptr<AXDPlugIn> named(std::optional<std::string> name,
                                           std::optional<std::string> shortName) {

@@ -108,16 +108,6 @@ TEST_F(AXDPlugInMatchingTest, KeysNameTheirValues) {
   }
 }
 
-TEST_F(AXDPlugInMatchingTest, ARuleNeedsEveryEntryAndNoRuleNeedsNothing) {
-  auto plugIn = record({{"Off", kFalse}});
-  EXPECT_TRUE(plugIn->match(std::nullopt));
-  EXPECT_TRUE(plugIn->match(Dictionary{}));
-  EXPECT_TRUE(
-      plugIn->match(Dictionary{{"QSExtensionIdentifier", S(kIdentifier)}, {"Off", kFalse}}));
-  EXPECT_FALSE(
-      plugIn->match(Dictionary{{"QSExtensionIdentifier", S(kIdentifier)}, {"Off", kTrue}}));
-}
-
 TEST_F(AXDPlugInMatchingTest, NoContainingApplicationNeverMatchesThatKey) {
   auto plugIn = record({}, false);
   for (const Value& pattern : {kFalse, kTrue, S(""), S("<>x")}) {

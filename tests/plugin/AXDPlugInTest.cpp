@@ -1,7 +1,5 @@
 #include <gtest/gtest.h>
 
-#include <limits>
-
 #include "axd/AXDPlugIn.h"
 #include "tests/annexa/LogCapture.h"
 #include "tests/platform/ScopedEnvironment.h"
@@ -31,36 +29,6 @@ class AXDPlugInTest : public ::testing::Test {
 
   ScopedEnvironment environment_;
 };
-
-TEST_F(AXDPlugInTest, HubProtocolVersionComesFromTheManifestElseFromItsStyle) {
-  auto version = [](std::optional<value::Value> declared, bool legacy) {
-    PlugInRecord::Fields fields = plugIn(kSystemPath);
-    if (declared)
-      fields.plugInDictionary = fields.plugInDictionary.with("HubProtocolVersion", *declared);
-    if (legacy) fields.infoDictionary = fields.infoDictionary.with("Annexa", D({}));
-    auto record = build(fields);
-    return record ? record->hubProtocolVersion() : 0u;
-  };
-  EXPECT_EQ(version(value::Value::integer(3), false), 3u);
-  EXPECT_EQ(version(value::Value::unsignedInteger(3), true), 3u);
-  EXPECT_EQ(version(std::nullopt, false), 2u);
-  EXPECT_EQ(version(std::nullopt, true), 1u);
-  // Values that are no unsigned 32-bit number count as absent.
-  EXPECT_EQ(version(S("3"), false), 2u);
-  EXPECT_EQ(version(value::Value::integer(-1), true), 1u);
-  EXPECT_EQ(version(value::Value::integer(std::int64_t{1} << 32), false), 2u);
-}
-
-TEST_F(AXDPlugInTest, RegistrationDateDropsTheFraction) {
-  auto lastModified = [](double date) {
-    PlugInRecord::Fields fields = plugIn(kSystemPath);
-    fields.registrationDate = date;
-    return build(fields)->lastModified();
-  };
-  EXPECT_EQ(lastModified(1000.9), 1000);
-  EXPECT_EQ(lastModified(-1.5), -1);
-  EXPECT_EQ(lastModified(1e12), std::numeric_limits<std::int32_t>::max());
-}
 
 TEST_F(AXDPlugInTest, NoBundleLocationOrIdentifierGivesNoRecord) {
   PlugInRecord::Fields noPath = plugIn(kSystemPath);
