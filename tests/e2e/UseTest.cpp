@@ -163,8 +163,6 @@ TEST_F(UseTest, EnablingRegistersTheServiceDescriptionWithTheLauncher) {
       << Value::dictionary(service.description).description();
 }
 
-// The host policy is tested in-process; here, that ready applies it and holds, and enables only
-// once every plug-in passed.
 // An uninstall by another process takes the plug-in out of discovery and out of the launcher's
 // table; its election comes back with it.
 TEST_F(UseTest, AnUninstalledPlugInIsWithdrawnAndKeepsItsElection) {
@@ -191,6 +189,8 @@ TEST_F(UseTest, AnUninstalledPlugInIsWithdrawnAndKeepsItsElection) {
             std::vector<std::string>{"gone.tool"});
 }
 
+// The host policy is tested in-process; here, that ready applies it and holds, and enables only
+// once every plug-in passed.
 TEST_F(UseTest, ReadyChecksEveryPlugInBeforeEnablingAny) {
   ASSERT_TRUE(start());
   Uuid first = uuid(install("Host", {.id = "ready.first"}));
