@@ -10,28 +10,19 @@
 #include <span>
 
 #include "FuzzInput.h"
-#include "axd/AXDPlugIn.h"
-#include "platform/registrum/PlugInRecord.h"
+#include "tests/plugin/RegistryRecords.h"
 
 namespace {
 
-constexpr const char* kIdentifier = "com.example.fuzzed";
-
+// The record the daemon would build for a plug-in whose Info.plist is |info|.
 std::shared_ptr<AXDPlugIn> recordFor(value::Dictionary info) {
-  registrum::PlugInRecord::Fields fields;
-  fields.uuid = value::Uuid::random();
-  fields.bundlePath = "/Applications/Host.app/PlugIns/Fuzzed.appex";
-  fields.plugInIdentifier = kIdentifier;
-  fields.originalIdentifier = kIdentifier;
-  fields.dataContainerPath = "/var/containers/" + fields.uuid.string();
-  if (const value::Value* plugIn = info.find("QSExtension")) {
-    if (const value::Dictionary* dictionary = plugIn->asDictionary()) {
-      fields.plugInDictionary = *dictionary;
-    }
-  }
+  registrum::PlugInRecord::Fields fields =
+      records::plugIn("/Applications/Host.app/PlugIns/Fuzzed.appex");
+  const value::Value* plugIn = info.find("QSExtension");
+  const value::Dictionary* dictionary = plugIn ? plugIn->asDictionary() : nullptr;
+  fields.plugInDictionary = dictionary ? *dictionary : value::Dictionary();
   fields.infoDictionary = std::move(info);
-  return AXDPlugIn::initWithRGData(
-      std::make_shared<const registrum::PlugInRecord>(std::move(fields)));
+  return records::build(std::move(fields));
 }
 
 }  // namespace
@@ -44,7 +35,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   std::shared_ptr<AXDPlugIn> plugIn = recordFor(std::move(*info));
   if (!plugIn) return 0;
   plugIn->match(*rule);
-  value::Dictionary own{{"QSExtensionIdentifier", value::Value::string(kIdentifier)},
+  value::Dictionary own{{"QSExtensionIdentifier", value::Value::string(records::kIdentifier)},
                         {AXD_VENDOR_PREFIX ".uuid",
                          value::Value::string(plugIn->uuid().value_or(value::Uuid()).string())}};
   if (!plugIn->match(std::nullopt) || !plugIn->match(value::Dictionary{}) || !plugIn->match(own)) {
