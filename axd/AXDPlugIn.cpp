@@ -6,10 +6,10 @@
 #include <map>
 
 #include "Annexa/AXFileURL.h"
-#include "Annexa/AXSandboxExtension.h"
 #include "platform/os/Format.h"
 #include "platform/os/Log.h"
 #include "platform/os/Paths.h"
+#include "platform/sandbox/Sandbox.h"
 
 namespace {
 
@@ -160,49 +160,60 @@ std::optional<AXError> AXDPlugIn::diagnose() const {
   return std::nullopt;
 }
 
-value::Dictionary AXDPlugIn::augmentForm(const value::Dictionary& form) const {
-  std::optional<value::Value> shared = pluginKey("Shared");
-  // An app extension shares its whole bundle, whatever "Shared" lists.
-  if (isAppExtension()) shared = value::Value::array({value::Value::string(".")});
-  if (!shared) return form;
-  return form.with("extensions", value::Value::dictionary(issueResourceExtensions(*shared)));
-}
-
 namespace {
 
-// A "Shared" entry such as "../.." would hand hosts the files around the bundle. Paths that do
-// not resolve are left to the issuing, which reports their own error.
-bool staysInsideBundle(const AXFileURL& target, const AXFileURL& bundle) {
-  os::Result<std::string> inside = os::Paths::canonical(target.path());
-  os::Result<std::string> root = os::Paths::canonical(bundle.path());
-  if (!inside.ok() || !root.ok()) return true;
-  return inside.value() == root.value() || inside.value().rfind(root.value() + "/", 0) == 0;
+// The canonical path of resource |name| of the bundle at |bundle| (canonical itself), or the
+// error number that keeps it from being shared: a "Shared" entry such as "../.." would hand
+// hosts the files around the bundle.
+os::Result<std::string> resolveResource(const std::string& bundle, const std::string& name) {
+  if (name == ".") return bundle;
+  os::Result<std::string> target = os::Paths::canonical(bundle + "/" + name);
+  if (!target.ok()) return target;
+  if (target.value() == bundle || target.value().starts_with(bundle + "/")) return target;
+  return os::Error{EACCES, target.value() + " is outside the bundle"};
 }
 
 }  // namespace
 
-value::Dictionary AXDPlugIn::issueResourceExtensions(const value::Value& resources) const {
-  value::Array list;
-  if (resources.asString()) list.push_back(resources);
-  if (const value::Array* array = resources.asArray()) list = *array;
-  std::optional<AXFileURL> bundle = url();
-  std::map<std::string, value::Value> extensions;
-  if (!bundle) return value::Dictionary();
-  for (const value::Value& element : list) {
-    const std::string* name = element.asString();
-    if (!name) continue;
-    AXFileURL target = *name == "." ? *bundle : AXFileURL(appendingPathComponent(*bundle, *name));
-    os::Result<std::string> token = staysInsideBundle(target, *bundle)
-                                        ? AXSandboxIssueReadExtension(target)
-                                        : os::Result<std::string>(os::Error{EACCES, "outside"});
-    if (token.ok()) {
-      extensions[*name] = value::Value::string(token.value());
-      continue;
+const std::optional<std::vector<AXDPlugIn::SharedResource>>& AXDPlugIn::sharedResources() const {
+  std::call_once(sharedResolved_, [this] {
+    std::optional<value::Value> listed = pluginKey("Shared");
+    // An app extension shares its whole bundle, whatever "Shared" lists.
+    if (isAppExtension()) listed = value::Value::array({value::Value::string(".")});
+    if (!listed) return;
+    value::Array names;
+    if (listed->asString()) names.push_back(*listed);
+    if (const value::Array* array = listed->asArray()) names = *array;
+    os::Result<std::string> bundle = os::Paths::canonical(path());
+    shared_.emplace();
+    for (const value::Value& element : names) {
+      const std::string* name = element.asString();
+      if (!name) continue;
+      os::Result<std::string> resolved =
+          bundle.ok() ? resolveResource(bundle.value(), *name) : bundle;
+      if (resolved.ok()) {
+        shared_->push_back({*name, resolved.value()});
+        continue;
+      }
+      std::string target = *name == "." ? path() : appendingPathComponent(AXFileURL(path()), *name);
+      os::Log::notice("failed to make extension for %@ in plug-in at %@: %s",
+                      {target, path(), std::strerror(resolved.error().errnum)});
     }
-    os::Log::notice("failed to make extension for %@ in plug-in at %@: %s",
-                    {target.path(), path(), std::strerror(token.error().errnum)});
+  });
+  return shared_;
+}
+
+value::Dictionary AXDPlugIn::augmentForm(const value::Dictionary& form,
+                                         const std::optional<std::string>& key) const {
+  const std::optional<std::vector<SharedResource>>& shared = sharedResources();
+  if (!shared) return form;
+  std::map<std::string, value::Value> extensions;
+  for (const SharedResource& resource : key ? *shared : std::vector<SharedResource>()) {
+    extensions[resource.name] =
+        value::Value::string(sandbox::Sandbox::sealReadExtension(resource.path, *key));
   }
-  return value::Dictionary(std::move(extensions));
+  return form.with("extensions",
+                   value::Value::dictionary(value::Dictionary(std::move(extensions))));
 }
 
 // ---- Entitlements and annotations --------------------------------------------------------------

@@ -1,10 +1,12 @@
 #pragma once
 
 #include <memory>
+#include <mutex>
 #include <optional>
 #include <set>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "Annexa/AXError.h"
 #include "Annexa/AXPlugInCore.h"
@@ -66,17 +68,26 @@ class AXDPlugIn : public AXPlugInCore {
   // fails.
   std::optional<AXError> diagnose() const override;
 
-  // |form| with "extensions" set to issueResourceExtensions of the plug-in's "Shared" resources
-  // (of ["."], the whole bundle, for an app extension), even when that dictionary is empty.
-  // Unchanged when the plug-in is not an app extension and has no "Shared".
-  value::Dictionary augmentForm(const value::Dictionary& form) const;
+  // A resource the plug-in shares with its hosts: its name in "Shared" ("." for the bundle) and
+  // the canonical path its read-extension token names.
+  struct SharedResource {
+    std::string name;
+    std::string path;
+  };
+  // The plug-in's shared resources: those of "Shared" (a string or an array of strings; other
+  // elements are skipped), or of ["."], the whole bundle, for an app extension. "." names the
+  // bundle, anything else a path inside it. Resolved at the first call and kept, so discovery
+  // touches no file per plug-in: the record is rebuilt whenever the registry changes the
+  // plug-in. A resource that does not resolve, or resolves outside the bundle, is left out and
+  // logged once as "failed to make extension for <target> in plug-in at <path>: <strerror>".
+  // Nothing when the plug-in is not an app extension and has no "Shared".
+  const std::optional<std::vector<SharedResource>>& sharedResources() const;
 
-  // A read-extension token for each resource of |resources| (a string or an array of strings;
-  // other elements are skipped), by resource name: "." names the bundle, anything else a path
-  // inside it. A resource whose extension cannot be issued is left out and logged as "failed
-  // to make extension for <target> in plug-in at <path>: <strerror>". Empty for a value that is
-  // neither a string nor an array.
-  value::Dictionary issueResourceExtensions(const value::Value& resources) const;
+  // |form| with "extensions" set to a read-extension token for each shared resource, by name,
+  // signed with |key|, the boot key read once for the whole request (empty without a key), even
+  // when that dictionary is empty. Unchanged when the plug-in shares nothing.
+  value::Dictionary augmentForm(const value::Dictionary& form,
+                                const std::optional<std::string>& key) const;
 
   // ---- Entitlements and annotations ----------------------------------------------------------
 
@@ -168,4 +179,6 @@ class AXDPlugIn : public AXPlugInCore {
                                      registrum::PlugInRecord::Scope scope) const;
 
   std::shared_ptr<const registrum::PlugInRecord> rgproxy_;
+  mutable std::once_flag sharedResolved_;
+  mutable std::optional<std::vector<SharedResource>> shared_;
 };

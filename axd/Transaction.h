@@ -85,8 +85,13 @@ class Transaction {
     std::uint64_t flags = 0;
     bool all = false;
     std::optional<value::Value> exclusions;
+    // The boot key that signs the forms' read extensions, read once for the whole discovery;
+    // nothing (logged) when it cannot be read, and the forms then carry no tokens.
+    std::optional<std::string> key;
   };
 
+  // The boot key for this discovery's tokens; nothing, logged, when it cannot be read.
+  std::optional<std::string> bootKey();
   // True when the client may discover with AXDiscoverAll: it has the manager entitlement and,
   // asked only then, runs outside any sandbox (a sandbox that cannot be asked counts as one).
   bool mayDiscoverAll();

@@ -8,6 +8,7 @@
 #include "axd/AXDZynClient.h"
 #include "axd/Transaction.h"
 #include "platform/os/Probes.h"
+#include "platform/sandbox/BootKey.h"
 #include "platform/sandbox/Sandbox.h"
 
 void Transaction::matchPlugIns() {
@@ -27,6 +28,7 @@ void Transaction::matchPlugIns() {
   }
   AXDMatchList matches(discovery.flags);
   discovery.exclusions = server()->userPrefs().exclusions();
+  discovery.key = bootKey();
   // A registry that cannot answer leaves nothing to discover; findPlugIns has logged why.
   AXDatabase::PlugIns candidates =
       server()->findPlugIns(discovery.rule).value_or(AXDatabase::PlugIns{});
@@ -36,6 +38,13 @@ void Transaction::matchPlugIns() {
       AXDaemonClient::convertToZyn(value::Value::array(matches.finish()), version_);
   if (list) reply_.set(AXProtocol::kMatches, *list);
   done();
+}
+
+std::optional<std::string> Transaction::bootKey() {
+  os::Result<std::string> key = sandbox::BootKey::load();
+  if (key.ok()) return key.value();
+  server()->log("cannot read the key of read extensions: %@", {key.error().message});
+  return std::nullopt;
 }
 
 bool Transaction::mayDiscoverAll() {
@@ -64,7 +73,7 @@ void Transaction::considerCandidate(const AXDPlugIn& plugIn, const Discovery& di
   // Exporting cannot fail, so the cheaper deduplication goes first.
   if (!matches.admit(plugIn)) return;
   value::Dictionary form = addAnnotationForPlugIn(plugIn, plugIn.exportForm());
-  matches.append(plugIn.augmentForm(form), plugIn);
+  matches.append(plugIn.augmentForm(form, discovery.key), plugIn);
 }
 
 bool Transaction::hiddenFromClient(const AXDPlugIn& plugIn, const Discovery& discovery) {

