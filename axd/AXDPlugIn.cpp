@@ -175,6 +175,11 @@ os::Result<std::string> resolveResource(const std::string& bundle, const std::st
 
 }  // namespace
 
+const value::Dictionary& AXDPlugIn::cachedForm() const {
+  std::call_once(formBuilt_, [this] { form_ = exportForm(); });
+  return form_;
+}
+
 const std::optional<std::vector<AXDPlugIn::SharedResource>>& AXDPlugIn::sharedResources() const {
   std::call_once(sharedResolved_, [this] {
     std::optional<value::Value> listed = pluginKey("Shared");

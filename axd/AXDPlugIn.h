@@ -68,6 +68,10 @@ class AXDPlugIn : public AXPlugInCore {
   // fails.
   std::optional<AXError> diagnose() const override;
 
+  // exportForm(), built at the first call and kept: a record never changes once initWithRGData
+  // has built it, and discovery would otherwise build the same form for every request.
+  const value::Dictionary& cachedForm() const;
+
   // A resource the plug-in shares with its hosts: its name in "Shared" ("." for the bundle) and
   // the canonical path its read-extension token names.
   struct SharedResource {
@@ -179,6 +183,8 @@ class AXDPlugIn : public AXPlugInCore {
                                      registrum::PlugInRecord::Scope scope) const;
 
   std::shared_ptr<const registrum::PlugInRecord> rgproxy_;
+  mutable std::once_flag formBuilt_;
+  mutable value::Dictionary form_;
   mutable std::once_flag sharedResolved_;
   mutable std::optional<std::vector<SharedResource>> shared_;
 };
