@@ -59,6 +59,15 @@ os::Status Database::transaction(const std::function<os::Status()>& body) {
   return outcome;
 }
 
+os::Result<Database::Version> Database::version() {
+  os::Result<Statement> pragma = prepare("PRAGMA data_version");
+  if (!pragma.ok()) return pragma.error();
+  os::Result<bool> row = pragma.value().step();
+  if (!row.ok()) return row.error();
+  if (!row.value()) return error("PRAGMA data_version");
+  return Version{pragma.value().integer(0), sqlite3_total_changes64(db_)};
+}
+
 void Database::releaseMemory() {
   for (auto& [sql, statement] : statements_) sqlite3_finalize(statement);
   statements_.clear();

@@ -43,6 +43,17 @@ class Database {
   // and returns that failure. Not re-entrant.
   os::Status transaction(const std::function<os::Status()>& body);
 
+  // What the database holds, as this connection can tell without reading it: PRAGMA
+  // data_version, which other connections' commits move, and the rows this connection has
+  // changed. Equal versions mean equal contents (a rolled-back change moves it too, which only
+  // costs a reader a fresh read). Fails with EIO.
+  struct Version {
+    std::int64_t others = 0;
+    std::int64_t own = 0;
+    bool operator==(const Version&) const = default;
+  };
+  os::Result<Version> version();
+
   // Finalises the cached statements and returns the connection's spare memory to the system.
   void releaseMemory();
 

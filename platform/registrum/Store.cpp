@@ -128,6 +128,22 @@ os::Result<std::vector<std::shared_ptr<const ApplicationRecord>>> Store::applica
 }
 
 os::Result<PlugInList> Store::plugIns(const Selection& selection) {
+  os::Result<Database::Version> version = db_->version();
+  if (!version.ok()) return version.error();
+  std::uint64_t sdkGeneration = sdks_->refresh();
+  if (version.value() != snapshot_.version || sdkGeneration != snapshot_.sdkGeneration ||
+      snapshot_.lists.size() >= kMaxSnapshotLists) {
+    snapshot_ = Snapshot{version.value(), sdkGeneration, {}};
+  }
+  auto key =
+      std::tuple(selection.plugInIdentifier, selection.rulePoint, selection.excludePlaceholders);
+  if (auto kept = snapshot_.lists.find(key); kept != snapshot_.lists.end()) return kept->second;
+  os::Result<PlugInList> read = readPlugIns(selection);
+  if (read.ok()) snapshot_.lists.emplace(std::move(key), read.value());
+  return read;
+}
+
+os::Result<PlugInList> Store::readPlugIns(const Selection& selection) {
   // Only the criteria that are set become terms: SQLite plans a statement before it sees the
   // parameters, so a term like "?1 IS NULL OR ..." would keep it from using the indexes.
   std::string where = "WHERE 1 ";

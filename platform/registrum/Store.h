@@ -1,10 +1,12 @@
 #pragma once
 
 #include <cstdint>
+#include <map>
 #include <memory>
 #include <optional>
 #include <set>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include "platform/os/Error.h"
@@ -65,6 +67,9 @@ class Store {
   os::Result<std::shared_ptr<const PlugInRecord>> plugInByPath(const std::string& path);
   os::Result<PlugInList> plugInsOfApplication(const std::string& path);
   os::Result<std::vector<std::shared_ptr<const ApplicationRecord>>> applications();
+  // The plug-ins |selection| admits, ordered by path. The same list, the same records, while
+  // neither the database (Database::version) nor the SDKs changed since it was read: one
+  // version check per call, no row read.
   os::Result<PlugInList> plugIns(const Selection& selection);
   // The keys of the rows the lookups above leave out as damaged, in path order.
   os::Result<std::vector<PlugInKey>> damagedPlugIns();
@@ -98,6 +103,8 @@ class Store {
 
   os::Result<std::shared_ptr<const PlugInRecord>> onePlugIn(const std::string& where,
                                                             const std::string& key);
+  // plugIns() read from the database.
+  os::Result<PlugInList> readPlugIns(const Selection& selection);
   os::Result<PlugInList> plugInRows(Statement& statement);
   os::Result<std::vector<PlugInKey>> plugInKeys(const std::string& where, const std::string& key);
   // Logs |error| about a damaged row once per row and Store.
@@ -107,9 +114,22 @@ class Store {
                                                             std::uint64_t sdkGeneration);
   static std::shared_ptr<const ApplicationRecord> applicationRow(const Statement& row, int first);
 
+  // The lists plugIns() returned, by selection, and what they were read at: reused while the
+  // database's version and the SDK generation stay, so a registry that did not change is not
+  // read again for every discovery.
+  struct Snapshot {
+    Database::Version version;
+    std::uint64_t sdkGeneration = 0;
+    std::map<std::tuple<std::optional<std::string>, std::optional<std::string>, bool>, PlugInList>
+        lists;
+  };
+  // At most this many selections are kept; one more starts the snapshot afresh.
+  static constexpr std::size_t kMaxSnapshotLists = 64;
+
   std::unique_ptr<Database> db_;
   const std::shared_ptr<sdk::SdkCache> sdks_;
   std::set<std::string> reportedDamaged_;
+  Snapshot snapshot_;
 };
 
 }  // namespace registrum
