@@ -19,6 +19,8 @@
 
 #include "Annexa/AXProtocol.h"
 #include "platform/prefs/Preferences.h"
+#include "platform/sandbox/BootKey.h"
+#include "platform/sandbox/Sandbox.h"
 #include "tests/e2e/Bundles.h"
 #include "tests/e2e/DaemonTest.h"
 
@@ -210,6 +212,24 @@ TEST_F(DiscoveryTest, AWarmDiscoveryMakesNoSystemCallPerPlugIn) {
   if (calls < 0) GTEST_SKIP() << "strace cannot trace the daemon here";
   EXPECT_EQ(found, kPlugIns);
   EXPECT_LT(calls, static_cast<long>(kPlugIns) / 3);
+}
+
+// The boot key is read for every discovery: a key made anew (the file removed, as at a reboot)
+// signs the very next reply's tokens, and the old tokens no longer open.
+TEST_F(DiscoveryTest, ANewBootKeySignsTheNextDiscoverysTokens) {
+  add({inApp("Keyed", {.id = "keyed.tool", .extension = {{"Shared", Value::string(".")}}})});
+  auto token = [&] {
+    value::Array forms = match();
+    const Value* extensions = forms.empty() ? nullptr : forms[0].asDictionary()->find("extensions");
+    const Value* bundle = extensions ? extensions->asDictionary()->find(".") : nullptr;
+    return bundle && bundle->asString() ? *bundle->asString() : std::string();
+  };
+  std::string before = token();
+  ASSERT_TRUE(sandbox::Sandbox::consume(before).ok());
+  std::filesystem::remove(sandbox::BootKey::path());
+  std::string after = token();
+  EXPECT_TRUE(sandbox::Sandbox::consume(after).ok());
+  EXPECT_EQ(sandbox::Sandbox::consume(before).error().errnum, EPERM);
 }
 
 TEST_F(DiscoveryTest, BadRulesAreRefusedAndProtocolVersionTwoGetsNoMatches) {
