@@ -175,11 +175,6 @@ os::Result<std::string> resolveResource(const std::string& bundle, const std::st
 
 }  // namespace
 
-const value::Dictionary& AXDPlugIn::cachedForm() const {
-  std::call_once(formBuilt_, [this] { form_ = exportForm(); });
-  return form_;
-}
-
 const std::optional<std::vector<AXDPlugIn::SharedResource>>& AXDPlugIn::sharedResources() const {
   std::call_once(sharedResolved_, [this] {
     std::optional<value::Value> listed = pluginKey("Shared");
@@ -219,6 +214,14 @@ value::Dictionary AXDPlugIn::augmentForm(const value::Dictionary& form,
   }
   return form.with("extensions",
                    value::Value::dictionary(value::Dictionary(std::move(extensions))));
+}
+
+value::Dictionary AXDPlugIn::discoveryForm(const std::optional<std::string>& key) const {
+  std::lock_guard lock(discoveryFormMutex_);
+  if (!discoveryForm_ || discoveryForm_->key != key) {
+    discoveryForm_ = DiscoveryForm{key, augmentForm(exportForm(), key)};
+  }
+  return discoveryForm_->form;
 }
 
 // ---- Entitlements and annotations --------------------------------------------------------------

@@ -68,10 +68,6 @@ class AXDPlugIn : public AXPlugInCore {
   // fails.
   std::optional<AXError> diagnose() const override;
 
-  // exportForm(), built at the first call and kept: a record never changes once initWithRGData
-  // has built it, and discovery would otherwise build the same form for every request.
-  const value::Dictionary& cachedForm() const;
-
   // A resource the plug-in shares with its hosts: its name in "Shared" ("." for the bundle) and
   // the canonical path its read-extension token names.
   struct SharedResource {
@@ -92,6 +88,11 @@ class AXDPlugIn : public AXPlugInCore {
   // when that dictionary is empty. Unchanged when the plug-in shares nothing.
   value::Dictionary augmentForm(const value::Dictionary& form,
                                 const std::optional<std::string>& key) const;
+  // augmentForm(exportForm(), key), kept for the last |key| it was asked with: a record never
+  // changes once initWithRGData has built it, and a token depends only on the key and the path,
+  // so discovery need not build the same form and seal the same tokens for every request.
+  // Safe from any thread.
+  value::Dictionary discoveryForm(const std::optional<std::string>& key) const;
 
   // ---- Entitlements and annotations ----------------------------------------------------------
 
@@ -183,8 +184,13 @@ class AXDPlugIn : public AXPlugInCore {
                                      registrum::PlugInRecord::Scope scope) const;
 
   std::shared_ptr<const registrum::PlugInRecord> rgproxy_;
-  mutable std::once_flag formBuilt_;
-  mutable value::Dictionary form_;
+  mutable std::mutex discoveryFormMutex_;
+  // The last discovery form and the key it was made with; guarded by discoveryFormMutex_.
+  struct DiscoveryForm {
+    std::optional<std::string> key;
+    value::Dictionary form;
+  };
+  mutable std::optional<DiscoveryForm> discoveryForm_;
   mutable std::once_flag sharedResolved_;
   mutable std::optional<std::vector<SharedResource>> shared_;
 };

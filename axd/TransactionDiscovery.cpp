@@ -72,8 +72,7 @@ void Transaction::considerCandidate(const AXDPlugIn& plugIn, const Discovery& di
   }
   // Exporting cannot fail, so the cheaper deduplication goes first.
   if (!matches.admit(plugIn)) return;
-  value::Dictionary form = addAnnotationForPlugIn(plugIn, plugIn.cachedForm());
-  matches.append(plugIn.augmentForm(form, discovery.key), plugIn);
+  matches.append(addAnnotationForPlugIn(plugIn, plugIn.discoveryForm(discovery.key)), plugIn);
 }
 
 bool Transaction::hiddenFromClient(const AXDPlugIn& plugIn, const Discovery& discovery) {

@@ -1,6 +1,7 @@
 #include "platform/value/Utf8.h"
 
 #include <cstdint>
+#include <cstring>
 
 namespace value {
 
@@ -26,10 +27,25 @@ std::size_t sequenceLength(std::string_view text) {
   return length;
 }
 
+// The length of the plain ASCII run at the start of |text|: the common case, and every string of
+// a reply is checked at every encoding, so it goes eight bytes at a time.
+std::size_t asciiPrefix(std::string_view text) {
+  constexpr std::uint64_t kHighBits = 0x8080808080808080ull;
+  std::size_t i = 0;
+  for (std::uint64_t word = 0; i + sizeof word <= text.size(); i += sizeof word) {
+    std::memcpy(&word, text.data() + i, sizeof word);
+    if (word & kHighBits) break;
+  }
+  while (i < text.size() && static_cast<std::uint8_t>(text[i]) < 0x80) ++i;
+  return i;
+}
+
 }  // namespace
 
 bool Utf8::valid(std::string_view text) {
   while (!text.empty()) {
+    text.remove_prefix(asciiPrefix(text));
+    if (text.empty()) return true;
     std::size_t length = sequenceLength(text);
     if (length == 0) return false;
     text.remove_prefix(length);
