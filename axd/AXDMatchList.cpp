@@ -4,43 +4,28 @@
 
 #include "Annexa/AXProtocol.h"
 #include "Annexa/AXUtilities.h"
-#include "axd/AXDNames.h"
 #include "axd/AXDPlugIn.h"
-
-namespace {
-
-std::string textField(const value::Dictionary& form, const char* key) {
-  const value::Value* field = form.find(key);
-  return field && field->asString() ? *field->asString() : std::string();
-}
-
-std::int64_t integerField(const value::Dictionary& form, const char* key) {
-  const value::Value* field = form.find(key);
-  return field ? field->integerValue().value_or(0) : 0;
-}
-
-}  // namespace
+#include "platform/value/CborCodec.h"
 
 bool AXDMatchList::admit(const AXDPlugIn& plugIn) {
-  auto group = byIdentifier_.find(plugIn.identifier().value_or(""));
+  auto group = byIdentifier_.find(plugIn.facts().identifier);
   if (group == byIdentifier_.end()) return true;
-  std::vector<Kept>& kept = group->second;
-  for (auto it = kept.begin(); it != kept.end(); ++it) {
-    std::optional<bool> replaces = decide(plugIn, *it->form);
+  std::vector<std::size_t>& positions = group->second;
+  for (auto it = positions.begin(); it != positions.end(); ++it) {
+    std::optional<bool> replaces = decide(plugIn, *kept_[*it].plugIn);
     if (!replaces) continue;
     if (*replaces) {
-      forms_[it->position] = nullptr;
-      kept.erase(it);
+      kept_[*it].removed = true;
+      positions.erase(it);
     }
     return *replaces;
   }
   return true;
 }
 
-std::optional<bool> AXDMatchList::decide(const AXDPlugIn& plugIn,
-                                         const value::Dictionary& existing) const {
+std::optional<bool> AXDMatchList::decide(const AXDPlugIn& plugIn, const AXDPlugIn& existing) const {
   std::strong_ordering order =
-      compareVersionString(plugIn.version().value_or(""), textField(existing, "version"));
+      compareVersionString(plugIn.facts().version, existing.facts().version);
   bool allVersions = flags_ & AXProtocol::kDiscoverAllVersions;
   bool allCopies = allVersions && (flags_ & AXProtocol::kDiscoverAllCopies);
   if (order != 0) {
@@ -51,41 +36,58 @@ std::optional<bool> AXDMatchList::decide(const AXDPlugIn& plugIn,
   return prefersNew(plugIn, existing);
 }
 
-bool AXDMatchList::prefersNew(const AXDPlugIn& plugIn, const value::Dictionary& existing) {
-  const value::Value* resident = existing.find("systemResident");
-  bool existingOnSystem = resident && resident->asBool() == std::optional<bool>(true);
-  if (plugIn.onSystemVolume() && !existingOnSystem) return true;
-  return plugIn.lastModified() > integerField(existing, "lastmodified");
+bool AXDMatchList::prefersNew(const AXDPlugIn& plugIn, const AXDPlugIn& existing) {
+  if (plugIn.facts().onSystemVolume && !existing.facts().onSystemVolume) return true;
+  return plugIn.facts().lastModified > existing.facts().lastModified;
 }
 
-void AXDMatchList::append(value::Dictionary form, const AXDPlugIn& plugIn) {
-  Form kept = std::make_shared<value::Dictionary>(std::move(form));
-  byIdentifier_[plugIn.identifier().value_or("")].push_back({kept, forms_.size()});
-  forms_.push_back(kept);
-  std::optional<value::Value> replaced =
-      plugIn.valueForEntitlement(AXDNames::kReplacePlugInEntitlement);
+void AXDMatchList::append(const AXDPlugIn& plugIn, value::Dictionary annotation) {
+  const std::size_t position = kept_.size();
+  kept_.push_back({&plugIn, value::Value::dictionary(std::move(annotation))});
+  byIdentifier_[plugIn.facts().identifier].push_back(position);
+  const std::optional<value::Value>& replaced = plugIn.facts().replaces;
   if (!replaced) return;
-  if (const std::string* identifier = replaced->asString()) overrides_[*identifier] = kept;
+  if (const std::string* identifier = replaced->asString()) overrides_[*identifier] = position;
   if (const value::Array* identifiers = replaced->asArray()) {
     for (const value::Value& element : *identifiers) {
-      if (const std::string* identifier = element.asString()) overrides_[*identifier] = kept;
+      if (const std::string* identifier = element.asString()) overrides_[*identifier] = position;
     }
   }
 }
 
-value::Array AXDMatchList::finish() {
-  for (const Form& form : forms_) {
-    if (!form) continue;
-    std::string identifier = textField(*form, "identifier");
+void AXDMatchList::write(std::vector<std::uint8_t>& out) const {
+  std::size_t live = 0;
+  for (const Kept& kept : kept_) live += kept.removed ? 0 : 1;
+  value::CborCodec::encodeArrayHead(live, out);
+  for (const Kept& kept : kept_) {
+    if (!kept.removed) writeForm(kept, out);
+  }
+}
+
+void AXDMatchList::linkOverrides() {
+  if (overrides_.empty()) return;
+  for (Kept& kept : kept_) {
+    if (kept.removed) continue;
+    const std::string& identifier = kept.plugIn->facts().identifier;
     auto entry = overrides_.find(identifier);
     if (entry == overrides_.end()) continue;
-    const Form& replacing = entry->second;
-    if (const value::Value* uuid = replacing->find("uuid")) *form = form->with("overrider", *uuid);
-    *replacing = replacing->with("overriding", value::Value::string(identifier));
+    Kept& replacing = kept_[entry->second];
+    if (std::optional<value::Uuid> uuid = replacing.plugIn->uuid()) {
+      kept.overrider = value::Value::string(uuid->string());
+    }
+    replacing.overriding = identifier;
   }
-  value::Array kept;
-  for (const Form& form : forms_) {
-    if (form) kept.push_back(value::Value::dictionary(*form));
+}
+
+// The form as the plug-in keeps it encoded; one that an override changes is built afresh.
+void AXDMatchList::writeForm(const Kept& kept, std::vector<std::uint8_t>& out) const {
+  if (!kept.overrider && !kept.overriding) {
+    kept.plugIn->discoveryForm(key_)->encodeWith(kept.annotation, out);
+    return;
   }
-  return kept;
+  value::Dictionary form = kept.plugIn->augmentForm(kept.plugIn->exportForm(), key_)
+                               .with("annotations", kept.annotation);
+  if (kept.overrider) form = form.with("overrider", *kept.overrider);
+  if (kept.overriding) form = form.with("overriding", value::Value::string(*kept.overriding));
+  value::CborCodec::encode(value::Value::dictionary(form), out);
 }

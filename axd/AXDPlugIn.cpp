@@ -6,6 +6,7 @@
 #include <map>
 
 #include "Annexa/AXFileURL.h"
+#include "axd/AXDNames.h"
 #include "platform/os/Format.h"
 #include "platform/os/Log.h"
 #include "platform/os/Paths.h"
@@ -82,6 +83,7 @@ std::shared_ptr<AXDPlugIn> AXDPlugIn::initWithRGData(
                     {url.path(), error->description()});
     return nullptr;
   }
+  record->readFacts();
   if (record->hostEntitlementDemand() == std::string()) {
     os::Log::notice("plug-in at %@ demands a malformed host entitlement %@: no host may use it",
                     {url.path(), record->pluginKey("QSExtensionHostEntitlement")->description()});
@@ -216,10 +218,12 @@ value::Dictionary AXDPlugIn::augmentForm(const value::Dictionary& form,
                    value::Value::dictionary(value::Dictionary(std::move(extensions))));
 }
 
-value::Dictionary AXDPlugIn::discoveryForm(const std::optional<std::string>& key) const {
+std::shared_ptr<const value::EncodedDictionary> AXDPlugIn::discoveryForm(
+    const std::optional<std::string>& key) const {
   std::lock_guard lock(discoveryFormMutex_);
   if (!discoveryForm_ || discoveryForm_->key != key) {
-    discoveryForm_ = DiscoveryForm{key, augmentForm(exportForm(), key)};
+    discoveryForm_ = DiscoveryForm{key, std::make_shared<const value::EncodedDictionary>(
+                                            augmentForm(exportForm(), key), "annotations")};
   }
   return discoveryForm_->form;
 }
@@ -243,11 +247,20 @@ bool AXDPlugIn::hasEntitlement(std::string_view name) const {
   return true;
 }
 
-std::string AXDPlugIn::annotationKey() const {
-  std::optional<value::Value> replaced =
-      valueForEntitlement(std::string(AXD_VENDOR_PREFIX) + ".developer.replace-plugin");
-  if (replaced && replaced->asString()) return *replaced->asString();
-  return identifier().value_or(std::string());
+void AXDPlugIn::readFacts() {
+  facts_.identifier = identifier().value_or(std::string());
+  facts_.version = version().value_or(std::string());
+  facts_.onSystemVolume = onSystemVolume();
+  facts_.contained = containingUrl().has_value();
+  facts_.lastModified = lastModified();
+  facts_.dedicated = isDedicated();
+  facts_.replaces = valueForEntitlement(AXDNames::kReplacePlugInEntitlement);
+  if (std::optional<value::Value> demand = pluginKey("QSExtensionHostEntitlement")) {
+    const std::string* name = demand->asString();
+    facts_.hostEntitlementDemand = name ? *name : std::string();
+  }
+  const std::string* replaced = facts_.replaces ? facts_.replaces->asString() : nullptr;
+  facts_.annotationKey = replaced ? *replaced : facts_.identifier;
 }
 
 value::Dictionary AXDPlugIn::prunedInfoDictionaryFor(const value::Dictionary& dictionary) {

@@ -12,6 +12,7 @@
 #include "Annexa/AXPlugInCore.h"
 #include "platform/registrum/PlugInRecord.h"
 #include "platform/value/Dictionary.h"
+#include "platform/value/EncodedDictionary.h"
 #include "platform/value/Value.h"
 
 class AXDZynClient;
@@ -37,6 +38,23 @@ class AXDPlugIn : public AXPlugInCore {
   // The registry record this record was built from; never null for a record made by
   // initWithRGData.
   const std::shared_ptr<const registrum::PlugInRecord>& rgproxy() const { return rgproxy_; }
+
+  // What discovery asks of every candidate, read once when the record is built (the record
+  // never changes afterwards), so a warm discovery neither locks nor copies per question.
+  struct Facts {
+    std::string identifier;  // always present in a record made by initWithRGData
+    std::string version;     // "" when the plug-in declares none
+    bool onSystemVolume = false;
+    bool contained = false;  // lies in an application
+    std::int32_t lastModified = 0;
+    bool dedicated = false;  // AXPlugInCore::isDedicated
+    // The entitlement "<vendor prefix>.developer.replace-plugin", or absent.
+    std::optional<value::Value> replaces;
+    // hostEntitlementDemand() and annotationKey(), below.
+    std::optional<std::string> hostEntitlementDemand;
+    std::string annotationKey;
+  };
+  const Facts& facts() const { return facts_; }
 
   // ---- Lookups through the registry record -------------------------------------------------
 
@@ -88,11 +106,13 @@ class AXDPlugIn : public AXPlugInCore {
   // when that dictionary is empty. Unchanged when the plug-in shares nothing.
   value::Dictionary augmentForm(const value::Dictionary& form,
                                 const std::optional<std::string>& key) const;
-  // augmentForm(exportForm(), key), kept for the last |key| it was asked with: a record never
-  // changes once initWithRGData has built it, and a token depends only on the key and the path,
-  // so discovery need not build the same form and seal the same tokens for every request.
-  // Safe from any thread.
-  value::Dictionary discoveryForm(const std::optional<std::string>& key) const;
+  // augmentForm(exportForm(), key) encoded, with the place of "annotations" left open for the
+  // annotation of the request (value::EncodedDictionary), kept for the last |key| it was asked
+  // with: a record never changes once initWithRGData has built it, and a token depends only on
+  // the key and the path, so discovery neither builds the same form, seals the same tokens nor
+  // encodes the same bytes for every request. Safe from any thread.
+  std::shared_ptr<const value::EncodedDictionary> discoveryForm(
+      const std::optional<std::string>& key) const;
 
   // ---- Entitlements and annotations ----------------------------------------------------------
 
@@ -104,7 +124,7 @@ class AXDPlugIn : public AXPlugInCore {
   // The key of the plug-in's annotations: the entitlement "<vendor prefix>.developer.replace-
   // plugin" when it is a string, else the identifier (always present in a record made by
   // initWithRGData).
-  std::string annotationKey() const;
+  const std::string& annotationKey() const { return facts_.annotationKey; }
 
   // ---- Matching rules (AXDPlugInMatching.cpp) -------------------------------------------------
 
@@ -144,7 +164,9 @@ class AXDPlugIn : public AXPlugInCore {
   // What "QSExtensionHostEntitlement" demands of a host: nothing when it is absent, else the
   // entitlement it names; the empty string when it is present but no string or empty, which no
   // host can meet.
-  std::optional<std::string> hostEntitlementDemand() const;
+  const std::optional<std::string>& hostEntitlementDemand() const {
+    return facts_.hostEntitlementDemand;
+  }
   // The consent services granted to the plug-in's containing application, read afresh from the
   // consent store. Empty for a plug-in outside any application, and, after a log line, when the
   // application cannot be opened or the store cannot answer for it.
@@ -183,12 +205,16 @@ class AXDPlugIn : public AXPlugInCore {
   std::optional<value::Value> lookup(std::string_view key,
                                      registrum::PlugInRecord::Scope scope) const;
 
+  // Fills facts_ from the record as built; the last step of initWithRGData.
+  void readFacts();
+
   std::shared_ptr<const registrum::PlugInRecord> rgproxy_;
+  Facts facts_;
   mutable std::mutex discoveryFormMutex_;
   // The last discovery form and the key it was made with; guarded by discoveryFormMutex_.
   struct DiscoveryForm {
     std::optional<std::string> key;
-    value::Dictionary form;
+    std::shared_ptr<const value::EncodedDictionary> form;
   };
   mutable std::optional<DiscoveryForm> discoveryForm_;
   mutable std::once_flag sharedResolved_;

@@ -15,7 +15,7 @@ std::optional<std::string> AXDPlugIn::allowForClient(const AXDZynClient& client)
     if (!rule) return "invalid host restriction entitlement";
     if (!match(*rule)) return "the host's plug-in entitlement does not allow this plug-in";
   }
-  std::optional<std::string> demanded = hostEntitlementDemand();
+  const std::optional<std::string>& demanded = hostEntitlementDemand();
   if (!demanded) return std::nullopt;
   // A demand that names no entitlement cannot be met: it must not read as no demand at all.
   if (demanded->empty()) return "the plug-in's host entitlement demand is malformed";
@@ -23,13 +23,6 @@ std::optional<std::string> AXDPlugIn::allowForClient(const AXDZynClient& client)
     return os::format("the host does not have the \"%@\" entitlement", {*demanded});
   }
   return std::nullopt;
-}
-
-std::optional<std::string> AXDPlugIn::hostEntitlementDemand() const {
-  std::optional<value::Value> demand = pluginKey("QSExtensionHostEntitlement");
-  if (!demand) return std::nullopt;
-  const std::string* name = demand->asString();
-  return name ? *name : std::string();
 }
 
 std::set<std::string> AXDPlugIn::allowedPCXServices() const {

@@ -117,14 +117,19 @@ std::optional<AXDatabase::PlugIns> AXDatabase::findPlugIns(
     os::Log::notice("Registrum query failed: %@", {candidates.error().message});
     return std::nullopt;
   }
-  PlugIns plugIns;
-  std::unordered_set<value::Uuid, value::UuidHash> seen;
-  for (const auto& candidate : candidates.value()) {
-    if (!isQueryCandidate(*candidate)) continue;
-    auto plugIn = plugInForProxy(candidate);
-    if (plugIn && seen.insert(*plugIn->uuid()).second) plugIns.push_back(std::move(plugIn));
-  }
-  return plugIns;
+  // One entry into _sync for the whole list, not one per candidate.
+  return _sync.sync([&] {
+    PlugIns plugIns;
+    plugIns.reserve(candidates.value().size());
+    std::unordered_set<value::Uuid, value::UuidHash> seen(candidates.value().size());
+    for (const auto& candidate : candidates.value()) {
+      if (!isQueryCandidate(*candidate)) continue;
+      auto cached = cache_.find(candidate->uuid());
+      auto plugIn = cached != cache_.end() ? cached->second : createPlugInForProxy(candidate);
+      if (plugIn && seen.insert(*plugIn->uuid()).second) plugIns.push_back(std::move(plugIn));
+    }
+    return plugIns;
+  });
 }
 
 bool AXDatabase::isQueryCandidate(const registrum::PlugInRecord& candidate) {

@@ -14,6 +14,7 @@
 
 class AXDMatchList;
 class AXDPlugIn;
+class AXDPlugInHold;
 class AXDServer;
 class AXDZynClient;
 namespace zyn {
@@ -58,10 +59,6 @@ class Transaction {
   void accessPlugIns();
   void lockDownPlugIns();
 
-  // |form| with "annotations" set to |plugIn|'s annotation, or to an empty dictionary when it
-  // has none: a discovered form always carries the key.
-  value::Dictionary addAnnotationForPlugIn(const AXDPlugIn& plugIn, const value::Dictionary& form);
-
   // Called per path with the path and whether it could be resolved (the resolved path when it
   // could, the path as given when not). Returns false to stop, having sent the failure reply.
   using PathVisitor = std::function<bool(const std::string& path, bool resolved)>;
@@ -85,6 +82,8 @@ class Transaction {
     std::uint64_t flags = 0;
     bool all = false;
     std::optional<value::Value> exclusions;
+    // The active holds when the discovery began.
+    std::vector<std::shared_ptr<AXDPlugInHold>> holds;
     // The boot key that signs the forms' read extensions, read once for the whole discovery;
     // nothing (logged) when it cannot be read, and the forms then carry no tokens.
     std::optional<std::string> key;

@@ -4,12 +4,14 @@
 #include "Annexa/AXProtocol.h"
 #include "axd/AXDMatchList.h"
 #include "axd/AXDNames.h"
+#include "axd/AXDPlugInHold.h"
 #include "axd/AXDServer.h"
 #include "axd/AXDZynClient.h"
 #include "axd/Transaction.h"
 #include "platform/os/Probes.h"
 #include "platform/sandbox/BootKey.h"
 #include "platform/sandbox/Sandbox.h"
+#include "platform/value/CborCodec.h"
 
 void Transaction::matchPlugIns() {
   Discovery discovery;
@@ -26,17 +28,26 @@ void Transaction::matchPlugIns() {
     fail(AXProtocol::kNotEntitled, "unauthorized discovery flag (AXDiscoverAll)");
     return;
   }
-  AXDMatchList matches(discovery.flags);
   discovery.exclusions = server()->userPrefs().exclusions();
+  discovery.holds = server()->holds();
   discovery.key = bootKey();
+  auto matches = std::make_shared<AXDMatchList>(discovery.flags, discovery.key);
   // A registry that cannot answer leaves nothing to discover; findPlugIns has logged why.
   AXDatabase::PlugIns candidates =
       server()->findPlugIns(discovery.rule).value_or(AXDatabase::PlugIns{});
   os::Probes::discoverRaw(static_cast<unsigned>(candidates.size()));
-  for (const auto& plugIn : candidates) considerCandidate(*plugIn, discovery, matches);
-  std::optional<value::Value> list =
-      AXDaemonClient::convertToZyn(value::Value::array(matches.finish()), version_);
-  if (list) reply_.set(AXProtocol::kMatches, *list);
+  for (const auto& plugIn : candidates) considerCandidate(*plugIn, discovery, *matches);
+  // The forms go out as the plug-ins keep them encoded, inside the envelope that
+  // AXDaemonClient::convertToZyn gives the list; older protocol versions get no list.
+  if (version_ == AXProtocol::kCurrentVersion) {
+    matches->linkOverrides();
+    // The list refers to the candidates' records, which the writer keeps alive.
+    reply_.setEncoded(AXProtocol::kMatches, [matches, candidates = std::move(candidates)](
+                                                std::vector<std::uint8_t>& out) {
+      value::CborCodec::encodeTag(value::CborCodec::kTagEnvelope, out);
+      matches->write(out);
+    });
+  }
   done();
 }
 
@@ -66,26 +77,30 @@ void Transaction::considerCandidate(const AXDPlugIn& plugIn, const Discovery& di
   if (!discovery.all) {
     if (std::optional<std::string> refusal = plugIn.allowForClient(*client_)) {
       server()->debug("client %d cannot use plugin %@: %@",
-                      {client_->pid(), plugIn.identifier().value_or("(null)"), *refusal});
+                      {client_->pid(), plugIn.facts().identifier, *refusal});
       return;
     }
   }
   // Exporting cannot fail, so the cheaper deduplication goes first.
   if (!matches.admit(plugIn)) return;
-  matches.append(addAnnotationForPlugIn(plugIn, plugIn.discoveryForm(discovery.key)), plugIn);
+  matches.append(plugIn, server()->annotationForPlugIn(plugIn).value_or(value::Dictionary()));
 }
 
 bool Transaction::hiddenFromClient(const AXDPlugIn& plugIn, const Discovery& discovery) {
-  if (!plugIn.onSystemVolume()) {
-    if (!plugIn.containingUrl()) return true;
+  const AXDPlugIn::Facts& facts = plugIn.facts();
+  if (!facts.onSystemVolume) {
+    if (!facts.contained) return true;
     if (discovery.flags & AXProtocol::kDiscoverSystemOnly) return true;
   }
-  if (plugIn.isDedicated()) {
+  if (facts.dedicated) {
     const std::shared_ptr<AXBundle>& bundle = client_->bundle();
     std::optional<std::string> plugIns = bundle ? bundle->plugInsPath() : std::nullopt;
     if (!plugIns || !plugIn.path().starts_with(*plugIns + "/")) return true;
   }
-  return server()->holdOnPlugIn(plugIn);
+  for (const auto& hold : discovery.holds) {
+    if (hold->blocks(plugIn)) return true;
+  }
+  return false;
 }
 
 bool Transaction::excluded(const AXDPlugIn& plugIn, const Discovery& discovery) {
@@ -100,11 +115,4 @@ bool Transaction::excluded(const AXDPlugIn& plugIn, const Discovery& discovery) 
     return true;
   }
   return false;
-}
-
-value::Dictionary Transaction::addAnnotationForPlugIn(const AXDPlugIn& plugIn,
-                                                      const value::Dictionary& form) {
-  std::optional<value::Dictionary> annotation = server()->annotationForPlugIn(plugIn);
-  return form.with("annotations",
-                   value::Value::dictionary(annotation.value_or(value::Dictionary())));
 }

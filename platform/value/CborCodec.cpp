@@ -130,6 +130,22 @@ void CborCodec::encode(const Value& value, Out& out) {
   }
 }
 
+void CborCodec::encodeArrayHead(std::size_t count, Out& out) {
+  head<std::size_t>(out, cbor_encode_array_start, count);
+}
+
+void CborCodec::encodeMapHead(std::size_t count, Out& out) {
+  head<std::size_t>(out, cbor_encode_map_start, count);
+}
+
+void CborCodec::encodeTag(std::uint64_t tag, Out& out) {
+  head<std::uint64_t>(out, cbor_encode_tag, tag);
+}
+
+void CborCodec::encodeText(std::string_view text, Out& out) {
+  textString(out, text);
+}
+
 os::Result<Value> CborCodec::decode(std::span<const std::uint8_t> bytes, std::size_t maxDepth,
                                     std::size_t maxItems) {
   CborBuilder builder(maxDepth, maxItems);

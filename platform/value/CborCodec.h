@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <span>
+#include <string_view>
 #include <vector>
 
 #include "platform/os/Error.h"
@@ -27,6 +28,14 @@ class CborCodec {
   // valid UTF-8 goes out with each offending byte replaced by U+FFFD, so the peer always gets a
   // well-formed text string. Never fails; recursion follows the value's own nesting.
   static void encode(const Value& value, std::vector<std::uint8_t>& out);
+
+  // The pieces of encode(), for a writer that puts an item together from parts it encoded
+  // earlier: the head of an array of |count| elements, of a map of |count| entries, a tag, and
+  // a text string (repaired as encode() repairs one).
+  static void encodeArrayHead(std::size_t count, std::vector<std::uint8_t>& out);
+  static void encodeMapHead(std::size_t count, std::vector<std::uint8_t>& out);
+  static void encodeTag(std::uint64_t tag, std::vector<std::uint8_t>& out);
+  static void encodeText(std::string_view text, std::vector<std::uint8_t>& out);
 
   // Decodes the one CBOR item that fills |bytes|, nesting at most |maxDepth| arrays, maps and
   // envelopes inside one another. Indefinite lengths are accepted. On failure returns an Error

@@ -11,12 +11,15 @@
 #include "platform/os/Log.h"
 #include "platform/os/Paths.h"
 #include "platform/os/Process.h"
+#include "platform/value/CborCodec.h"
 
 namespace zyn {
 
 namespace {
 
 constexpr std::size_t kReadChunk = 64 * 1024;
+// The largest frame buffer a writing thread keeps between frames.
+constexpr std::size_t kKeptWriteBuffer = 1u << 20;
 
 ServiceError invalidError(const std::string& why) {
   return ServiceError{ErrorKind::ConnectionInvalid, "Connection invalid: " + why};
@@ -263,7 +266,8 @@ void Connection::deliver(Event event) {
 
 os::Status Connection::send(const Reply& reply) {
   if (!reply.expected()) return os::success();
-  return write(FrameKind::Reply, reply.id(), reply.body());
+  return write(FrameKind::Reply, reply.id(),
+               [&reply](std::vector<std::uint8_t>& item) { reply.encode(item); });
 }
 
 os::Status Connection::sendMessage(const value::Value& body) {
@@ -298,8 +302,22 @@ void Connection::cancel() {
 }
 
 os::Status Connection::write(FrameKind kind, std::uint64_t id, const value::Value& body) {
-  std::vector<std::uint8_t> bytes;
-  if (!encodeFrame(Frame{kind, id, body}, bytes)) {
+  return write(kind, id,
+               [&body](std::vector<std::uint8_t>& item) { value::CborCodec::encode(body, item); });
+}
+
+os::Status Connection::write(FrameKind kind, std::uint64_t id, const ItemWriter& writeItem) {
+  // Frames are encoded into a buffer kept by the writing thread, so a large reply neither grows
+  // a new vector step by step nor faults in fresh pages each time; only what the socket does
+  // not take at once is copied to the backlog.
+  thread_local std::vector<std::uint8_t> bytes;
+  bytes.clear();
+  struct Trim {
+    ~Trim() {
+      if (bytes.capacity() > kKeptWriteBuffer) std::vector<std::uint8_t>().swap(bytes);
+    }
+  } trim;
+  if (!encodeFrame(kind, id, writeItem, bytes)) {
     return os::Error{EMSGSIZE, os::format("%s too large (4 GiB or more, limit %zu)",
                                           {kindName(kind), limits_.maxFrameBytes})};
   }
@@ -313,9 +331,11 @@ os::Status Connection::write(FrameKind kind, std::uint64_t id, const value::Valu
   if (closed_) return os::success();
   std::size_t offset = 0;
   if (backlog_.empty() && sendNow(bytes, offset)) return os::success();
-  if (backlog_.empty()) backlogOffset_ = offset;
-  backlogBytes_ += bytes.size();
-  backlog_.push_back(std::move(bytes));
+  std::vector<std::uint8_t> rest = std::move(spare_);
+  rest.assign(bytes.begin() + static_cast<std::ptrdiff_t>(offset), bytes.end());
+  if (backlog_.empty()) backlogOffset_ = 0;
+  backlogBytes_ += rest.size();
+  backlog_.push_back(std::move(rest));
   if (backlog_.size() > 1 && backlogBytes_ > kMaxBacklogBytes) {
     os::Log::write(4, os::format("disconnecting %@: more than %zu bytes wait to be sent",
                                  {description(), kMaxBacklogBytes}));
@@ -346,6 +366,7 @@ void Connection::flush() {
       return;
     }
     backlogBytes_ -= front.size();
+    if (front.capacity() <= kKeptWriteBuffer) spare_ = std::move(front);
     backlog_.pop_front();
     backlogOffset_ = 0;
   }

@@ -120,7 +120,9 @@ class Connection : public std::enable_shared_from_this<Connection> {
   ReplyHandler takePending(std::uint64_t id);
   void invalidate(std::string why);
   void deliver(Event event);
+  using ItemWriter = std::function<void(std::vector<std::uint8_t>&)>;
   os::Status write(FrameKind kind, std::uint64_t id, const value::Value& body);
+  os::Status write(FrameKind kind, std::uint64_t id, const ItemWriter& writeItem);
   void flushLater();
   void flush();
   bool sendNow(std::vector<std::uint8_t>& bytes, std::size_t& offset);
@@ -146,6 +148,9 @@ class Connection : public std::enable_shared_from_this<Connection> {
   std::mutex writeMutex_;  // guards the socket's descriptor for writing and everything below
   std::deque<std::vector<std::uint8_t>> backlog_;
   std::size_t backlogOffset_ = 0;
+  // The last sent backlog buffer, reused for the next one so that a client that takes large
+  // replies does not cost fresh pages for each.
+  std::vector<std::uint8_t> spare_;
   std::size_t backlogBytes_ = 0;
   bool flushing_ = false;
   bool closed_ = false;

@@ -41,11 +41,20 @@ bool knownKind(std::uint8_t kind) {
 }  // namespace
 
 bool encodeFrame(const Frame& frame, std::vector<std::uint8_t>& out) {
+  return encodeFrame(
+      frame.kind, frame.id,
+      [&frame](std::vector<std::uint8_t>& item) { value::CborCodec::encode(frame.body, item); },
+      out);
+}
+
+bool encodeFrame(FrameKind kind, std::uint64_t id,
+                 const std::function<void(std::vector<std::uint8_t>&)>& writeItem,
+                 std::vector<std::uint8_t>& out) {
   std::size_t start = out.size();
   out.resize(start + kHeaderBytes);
-  out[start + kLengthBytes] = static_cast<std::uint8_t>(frame.kind);
-  putBigEndian(&out[start + kLengthBytes + 1], frame.id, 8);
-  value::CborCodec::encode(frame.body, out);
+  out[start + kLengthBytes] = static_cast<std::uint8_t>(kind);
+  putBigEndian(&out[start + kLengthBytes + 1], id, 8);
+  writeItem(out);
   std::size_t length = out.size() - start - kLengthBytes;
   if (length > UINT32_MAX) {
     out.resize(start);

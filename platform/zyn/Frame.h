@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <optional>
 #include <vector>
@@ -48,6 +49,10 @@ struct FrameLimits {
 // the peer's limit. False, with |out| as it was, when the frame would be 4 GiB or more, which the
 // length field cannot say.
 bool encodeFrame(const Frame& frame, std::vector<std::uint8_t>& out);
+// The same for a frame whose item |writeItem| appends to the vector it is given.
+bool encodeFrame(FrameKind kind, std::uint64_t id,
+                 const std::function<void(std::vector<std::uint8_t>&)>& writeItem,
+                 std::vector<std::uint8_t>& out);
 
 // Incremental decoder over one connection's byte stream: the reader writes into prepare()'s
 // space, commits what it read, then takes frames with next() until it yields nothing. Bytes are

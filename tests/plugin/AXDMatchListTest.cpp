@@ -3,12 +3,15 @@
 
 #include <gtest/gtest.h>
 
+#include <map>
 #include <string>
 #include <vector>
 
 #include "Annexa/AXProtocol.h"
 #include "axd/AXDMatchList.h"
 #include "axd/AXDNames.h"
+#include "axd/AXDPlugIn.h"
+#include "platform/value/CborCodec.h"
 #include "tests/platform/ScopedEnvironment.h"
 #include "tests/plugin/RegistryRecords.h"
 
@@ -53,24 +56,34 @@ class AXDMatchListTest : public ::testing::Test {
     return built;
   }
 
-  // The forms that a request with |flags| keeps of |copies|, offered in order; each form is
-  // labelled with the index of its copy.
-  static value::Array discover(std::uint64_t flags, const std::vector<Copy>& copies) {
-    AXDMatchList list(flags);
+  // The forms that a request with |flags| keeps of |copies|, offered in order, as the list
+  // writes them; |labels| gets the index of each form's copy.
+  static value::Array discover(std::uint64_t flags, const std::vector<Copy>& copies,
+                               std::vector<std::int64_t>* labels = nullptr) {
+    AXDMatchList list(flags, std::nullopt);
+    std::vector<std::shared_ptr<AXDPlugIn>> offered;
+    std::map<std::string, std::int64_t> labelOfUuid;
     for (std::size_t i = 0; i < copies.size(); ++i) {
-      auto plugIn = record(copies[i]);
-      if (list.admit(*plugIn)) {
-        list.append(
-            plugIn->exportForm().with("label", Value::integer(static_cast<std::int64_t>(i))),
-            *plugIn);
-      }
+      offered.push_back(record(copies[i]));
+      labelOfUuid[offered.back()->uuid()->string()] = static_cast<std::int64_t>(i);
+      if (list.admit(*offered.back())) list.append(*offered.back(), {});
     }
-    return list.finish();
+    std::vector<std::uint8_t> bytes;
+    list.linkOverrides();
+    list.write(bytes);
+    auto decoded = value::CborCodec::decode(bytes);
+    EXPECT_TRUE(decoded.ok() && decoded.value().asArray());
+    if (!decoded.ok() || !decoded.value().asArray()) return {};
+    value::Array forms = *decoded.value().asArray();
+    for (const Value& form : forms) {
+      if (labels) labels->push_back(labelOfUuid[*form.asDictionary()->find("uuid")->asString()]);
+    }
+    return forms;
   }
 
-  static std::vector<std::int64_t> labels(const value::Array& forms) {
+  static std::vector<std::int64_t> labels(std::uint64_t flags, const std::vector<Copy>& copies) {
     std::vector<std::int64_t> kept;
-    for (const Value& form : forms) kept.push_back(*form.asDictionary()->find("label")->asInt());
+    discover(flags, copies, &kept);
     return kept;
   }
 
@@ -92,23 +105,22 @@ TEST_F(AXDMatchListTest, CopiesOfOneVersionPreferTheSystemThenTheLaterTime) {
       {{.modified = -5}, {.modified = -1}, {1}},
   };
   for (std::size_t i = 0; i < std::size(cases); ++i) {
-    EXPECT_EQ(labels(discover(0, {cases[i].first, cases[i].second})), cases[i].expected)
-        << "case " << i;
+    EXPECT_EQ(labels(0, {cases[i].first, cases[i].second}), cases[i].expected) << "case " << i;
   }
 }
 
 TEST_F(AXDMatchListTest, AReplacementGoesToTheEndAndTheReplacedLeavesItsPlace) {
-  EXPECT_EQ(labels(discover(0, {{.identifier = "a"},
-                                {.identifier = "b"},
-                                {.identifier = "c"},
-                                {.identifier = "a", .version = "2"}})),
+  EXPECT_EQ(labels(0, {{.identifier = "a"},
+                       {.identifier = "b"},
+                       {.identifier = "c"},
+                       {.identifier = "a", .version = "2"}}),
             (Labels{1, 2, 3}));
   // The walk passes other versions to reach the copy of the same version.
-  EXPECT_EQ(labels(discover(kVersions, {{.version = "1"},
-                                        {.version = "2"},
-                                        {.identifier = "b"},
-                                        {.version = "2", .modified = 1},
-                                        {.version = "2"}})),
+  EXPECT_EQ(labels(kVersions, {{.version = "1"},
+                               {.version = "2"},
+                               {.identifier = "b"},
+                               {.version = "2", .modified = 1},
+                               {.version = "2"}}),
             (Labels{0, 2, 3}));
 }
 
@@ -139,6 +151,33 @@ TEST_F(AXDMatchListTest, OverridesLinkTheReplacedAndTheReplacing) {
     EXPECT_EQ(field(i, "overriding"), "none") << i;
     EXPECT_EQ(field(i, "overrider"), "none") << i;
   }
+}
+
+// The forms go out as each plug-in keeps them encoded; the bytes must be those of the form
+// built as a value, with its annotation and override links, encoded whole.
+TEST_F(AXDMatchListTest, WritesEachFormAsItsValueEncodes) {
+  std::vector<std::shared_ptr<AXDPlugIn>> plugIns = {
+      record({.identifier = "a"}), record({.identifier = "r", .replaces = S("a")})};
+  const value::Dictionary annotation{{"election", Value::integer(1)}};
+  AXDMatchList list(0, std::string(32, 'k'));
+  for (const auto& plugIn : plugIns) {
+    ASSERT_TRUE(list.admit(*plugIn));
+    list.append(*plugIn, annotation);
+  }
+  list.linkOverrides();
+  std::vector<std::uint8_t> written;
+  list.write(written);
+
+  auto form = [&](const AXDPlugIn& plugIn) {
+    return plugIn.augmentForm(plugIn.exportForm(), std::string(32, 'k'))
+        .with("annotations", Value::dictionary(annotation));
+  };
+  value::Array expected = {
+      Value::dictionary(form(*plugIns[0]).with("overrider", S(plugIns[1]->uuid()->string()))),
+      Value::dictionary(form(*plugIns[1]).with("overriding", S("a")))};
+  std::vector<std::uint8_t> encoded;
+  value::CborCodec::encode(Value::array(expected), encoded);
+  EXPECT_EQ(written, encoded);
 }
 
 }  // namespace
