@@ -7,20 +7,28 @@
 #include "axd/AXDPlugIn.h"
 #include "platform/value/CborCodec.h"
 
+void AXDMatchList::reserve(std::size_t count) {
+  kept_.reserve(count);
+  byIdentifier_.reserve(count);
+}
+
 bool AXDMatchList::admit(const AXDPlugIn& plugIn) {
-  auto group = byIdentifier_.find(plugIn.facts().identifier);
-  if (group == byIdentifier_.end()) return true;
-  std::vector<std::size_t>& positions = group->second;
-  for (auto it = positions.begin(); it != positions.end(); ++it) {
-    std::optional<bool> replaces = decide(plugIn, *kept_[*it].plugIn);
+  auto chain = byIdentifier_.find(plugIn.facts().identifier);
+  if (chain == byIdentifier_.end()) return true;
+  for (std::size_t at = chain->second.first, before = kNone; at != kNone;
+       before = at, at = kept_[at].next) {
+    std::optional<bool> replaces = decide(plugIn, *kept_[at].plugIn);
     if (!replaces) continue;
-    if (*replaces) {
-      kept_[*it].removed = true;
-      positions.erase(it);
-    }
+    if (*replaces) unlink(chain->second, at, before);
     return *replaces;
   }
   return true;
+}
+
+void AXDMatchList::unlink(Chain& chain, std::size_t at, std::size_t before) {
+  kept_[at].removed = true;
+  (before == kNone ? chain.first : kept_[before].next) = kept_[at].next;
+  if (chain.last == at) chain.last = before;
 }
 
 std::optional<bool> AXDMatchList::decide(const AXDPlugIn& plugIn, const AXDPlugIn& existing) const {
@@ -41,10 +49,12 @@ bool AXDMatchList::prefersNew(const AXDPlugIn& plugIn, const AXDPlugIn& existing
   return plugIn.facts().lastModified > existing.facts().lastModified;
 }
 
-void AXDMatchList::append(const AXDPlugIn& plugIn, value::Dictionary annotation) {
+void AXDMatchList::append(const AXDPlugIn& plugIn, value::Value annotation) {
   const std::size_t position = kept_.size();
-  kept_.push_back({&plugIn, value::Value::dictionary(std::move(annotation))});
-  byIdentifier_[plugIn.facts().identifier].push_back(position);
+  kept_.push_back({&plugIn, plugIn.discoveryForm(key_), std::move(annotation)});
+  Chain& chain = byIdentifier_[plugIn.facts().identifier];
+  (chain.last == kNone ? chain.first : kept_[chain.last].next) = position;
+  chain.last = position;
   const std::optional<value::Value>& replaced = plugIn.facts().replaces;
   if (!replaced) return;
   if (const std::string* identifier = replaced->asString()) overrides_[*identifier] = position;
@@ -82,11 +92,12 @@ void AXDMatchList::linkOverrides() {
 // The form as the plug-in keeps it encoded; one that an override changes is built afresh.
 void AXDMatchList::writeForm(const Kept& kept, std::vector<std::uint8_t>& out) const {
   if (!kept.overrider && !kept.overriding) {
-    kept.plugIn->discoveryForm(key_)->encodeWith(kept.annotation, out);
+    kept.form->encodeWith(kept.annotation, out);
     return;
   }
-  value::Dictionary form = kept.plugIn->augmentForm(kept.plugIn->exportForm(), key_)
-                               .with("annotations", kept.annotation);
+  std::optional<std::string> key = key_ ? std::optional(*key_) : std::nullopt;
+  value::Dictionary form =
+      kept.plugIn->augmentForm(kept.plugIn->exportForm(), key).with("annotations", kept.annotation);
   if (kept.overrider) form = form.with("overrider", *kept.overrider);
   if (kept.overriding) form = form.with("overriding", value::Value::string(*kept.overriding));
   value::CborCodec::encode(value::Value::dictionary(form), out);

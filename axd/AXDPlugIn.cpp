@@ -219,12 +219,16 @@ value::Dictionary AXDPlugIn::augmentForm(const value::Dictionary& form,
 }
 
 std::shared_ptr<const value::EncodedDictionary> AXDPlugIn::discoveryForm(
-    const std::optional<std::string>& key) const {
+    const SealingKey& key) const {
   std::lock_guard lock(discoveryFormMutex_);
-  if (!discoveryForm_ || discoveryForm_->key != key) {
-    discoveryForm_ = DiscoveryForm{key, std::make_shared<const value::EncodedDictionary>(
-                                            augmentForm(exportForm(), key), "annotations")};
+  if (discoveryForm_ && discoveryForm_->key == key) return discoveryForm_->form;
+  if (discoveryForm_ && discoveryForm_->key && key && *discoveryForm_->key == *key) {
+    discoveryForm_->key = key;
+    return discoveryForm_->form;
   }
+  std::optional<std::string> text = key ? std::optional(*key) : std::nullopt;
+  discoveryForm_ = DiscoveryForm{key, std::make_shared<const value::EncodedDictionary>(
+                                          augmentForm(exportForm(), text), "annotations")};
   return discoveryForm_->form;
 }
 
@@ -249,6 +253,8 @@ bool AXDPlugIn::hasEntitlement(std::string_view name) const {
 
 void AXDPlugIn::readFacts() {
   facts_.identifier = identifier().value_or(std::string());
+  facts_.identifierValue = value::Value::string(facts_.identifier);
+  facts_.extensionPoint = manifestValue("QSExtensionPointIdentifier");
   facts_.version = version().value_or(std::string());
   facts_.onSystemVolume = onSystemVolume();
   facts_.contained = containingUrl().has_value();

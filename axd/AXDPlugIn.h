@@ -42,8 +42,11 @@ class AXDPlugIn : public AXPlugInCore {
   // What discovery asks of every candidate, read once when the record is built (the record
   // never changes afterwards), so a warm discovery neither locks nor copies per question.
   struct Facts {
-    std::string identifier;  // always present in a record made by initWithRGData
-    std::string version;     // "" when the plug-in declares none
+    std::string identifier;        // always present in a record made by initWithRGData
+    value::Value identifierValue;  // the same, as the rule language reads it
+    // The manifest's "QSExtensionPointIdentifier", the key hosts discover by, or absent.
+    std::optional<value::Value> extensionPoint;
+    std::string version;  // "" when the plug-in declares none
     bool onSystemVolume = false;
     bool contained = false;  // lies in an application
     std::int32_t lastModified = 0;
@@ -106,13 +109,16 @@ class AXDPlugIn : public AXPlugInCore {
   // when that dictionary is empty. Unchanged when the plug-in shares nothing.
   value::Dictionary augmentForm(const value::Dictionary& form,
                                 const std::optional<std::string>& key) const;
+  // The boot key that seals a discovery's tokens, shared: a discovery hands every record the
+  // same object, so a record tells its kept form is current by one pointer comparison. Null
+  // when there is no key.
+  using SealingKey = std::shared_ptr<const std::string>;
   // augmentForm(exportForm(), key) encoded, with the place of "annotations" left open for the
   // annotation of the request (value::EncodedDictionary), kept for the last |key| it was asked
   // with: a record never changes once initWithRGData has built it, and a token depends only on
   // the key and the path, so discovery neither builds the same form, seals the same tokens nor
   // encodes the same bytes for every request. Safe from any thread.
-  std::shared_ptr<const value::EncodedDictionary> discoveryForm(
-      const std::optional<std::string>& key) const;
+  std::shared_ptr<const value::EncodedDictionary> discoveryForm(const SealingKey& key) const;
 
   // ---- Entitlements and annotations ----------------------------------------------------------
 
@@ -213,7 +219,7 @@ class AXDPlugIn : public AXPlugInCore {
   mutable std::mutex discoveryFormMutex_;
   // The last discovery form and the key it was made with; guarded by discoveryFormMutex_.
   struct DiscoveryForm {
-    std::optional<std::string> key;
+    SealingKey key;
     std::shared_ptr<const value::EncodedDictionary> form;
   };
   mutable std::optional<DiscoveryForm> discoveryForm_;

@@ -62,7 +62,9 @@ bool AXDPlugIn::matchKey(const std::string& key, const value::Value& pattern) co
   if (key.starts_with(kEntitlementPrefix)) {
     found = valueForEntitlement(std::string_view(key).substr(kEntitlementPrefix.size()));
   } else if (key == "QSExtensionIdentifier") {
-    if (auto id = identifier()) found = value::Value::string(*id);
+    found = facts_.identifierValue;
+  } else if (key == "QSExtensionPointIdentifier") {
+    found = facts_.extensionPoint;
   } else if (key == kUuidKey) {
     if (auto id = uuid()) found = value::Value::string(id->string());
   } else if (key == "QSUserElection") {

@@ -91,6 +91,13 @@ bool AXDServer::holdOnPlugIn(const AXDPlugIn& plugIn) {
   });
 }
 
+AXDPlugIn::SealingKey AXDServer::sealingKey(std::string key) {
+  if (!sealingKey_ || *sealingKey_ != key) {
+    sealingKey_ = std::make_shared<const std::string>(std::move(key));
+  }
+  return sealingKey_;
+}
+
 bool AXDServer::addHold(std::shared_ptr<AXDPlugInHold> hold) {
   // The client's death stops its work before its holds are released under this same queue, so
   // a hold added here is either released by that release or refused now.

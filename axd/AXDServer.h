@@ -70,6 +70,10 @@ class AXDServer : public AXDatabase, public AXDatabaseDelegate {
   // The active holds, in the order they were added.
   std::vector<std::shared_ptr<AXDPlugInHold>> holds();
 
+  // |key| as the one shared object that every discovery with this key hands the records
+  // (AXDPlugIn::SealingKey). Runs on the service queue.
+  AXDPlugIn::SealingKey sealingKey(std::string key);
+
   // Withdraws the launcher services of |plugIns| without waiting; failures other than "none
   // registered" are logged from the service queue.
   void removedPlugIns(const registrum::PlugInList& plugIns) override;
@@ -99,4 +103,5 @@ class AXDServer : public AXDatabase, public AXDatabaseDelegate {
   std::shared_ptr<zyn::Listener> service_;
   std::unique_ptr<zyn::SyncQueue> syncQueue_;
   std::vector<std::shared_ptr<AXDPlugInHold>> holds_;  // guarded by syncQueue_
+  AXDPlugIn::SealingKey sealingKey_;                   // on the service queue
 };

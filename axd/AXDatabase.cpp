@@ -46,6 +46,7 @@ void AXDatabase::noteSdkChanges() {
     if (!cache_.empty())
       os::Log::notice("SDKs changed: dropping %d cached plug-ins", {cache_.size()});
     cache_.clear();
+    resolved_.clear();
   });
 }
 
@@ -67,6 +68,7 @@ std::shared_ptr<AXDPlugIn> AXDatabase::createPlugInForProxy(
   if (rgData->sdkGeneration() < sdkGeneration_) return plugIn;
   purgeCachesToLimit(cacheLimit_);
   cache_[*plugIn->uuid()] = plugIn;
+  resolved_.clear();
   return plugIn;
 }
 
@@ -74,6 +76,7 @@ void AXDatabase::purgeCachesToLimit(std::uint32_t limit) {
   if (cache_.size() <= limit) return;
   os::Log::notice("purging cache for %d > %d", {cache_.size(), limit});
   cache_.clear();
+  resolved_.clear();
   workspace_->clearCaches();
 }
 
@@ -109,27 +112,34 @@ std::optional<AXDatabase::PlugIns> AXDatabase::plugInsWithinApplication(const st
   return plugIns;
 }
 
-std::optional<AXDatabase::PlugIns> AXDatabase::findPlugIns(
+std::shared_ptr<const AXDatabase::PlugIns> AXDatabase::findPlugIns(
     const std::optional<value::Dictionary>& rule) {
   auto candidates = (!rule || rule->empty()) ? workspace_->listPlugIns()
                                              : workspace_->query(*rule, electionFilter(*rule));
   if (!candidates.ok()) {
     os::Log::notice("Registrum query failed: %@", {candidates.error().message});
-    return std::nullopt;
+    return nullptr;
   }
   // One entry into _sync for the whole list, not one per candidate.
-  return _sync.sync([&] {
-    PlugIns plugIns;
-    plugIns.reserve(candidates.value().size());
-    std::unordered_set<value::Uuid, value::UuidHash> seen(candidates.value().size());
-    for (const auto& candidate : candidates.value()) {
-      if (!isQueryCandidate(*candidate)) continue;
-      auto cached = cache_.find(candidate->uuid());
-      auto plugIn = cached != cache_.end() ? cached->second : createPlugInForProxy(candidate);
-      if (plugIn && seen.insert(*plugIn->uuid()).second) plugIns.push_back(std::move(plugIn));
-    }
-    return plugIns;
-  });
+  return _sync.sync([&] { return resolve(std::move(candidates).value()); });
+}
+
+std::shared_ptr<const AXDatabase::PlugIns> AXDatabase::resolve(registrum::PlugInList candidates) {
+  for (const Resolved& earlier : resolved_) {
+    if (earlier.candidates == candidates) return earlier.plugIns;
+  }
+  auto plugIns = std::make_shared<PlugIns>();
+  plugIns->reserve(candidates.size());
+  std::unordered_set<value::Uuid, value::UuidHash> seen(candidates.size());
+  for (const auto& candidate : candidates) {
+    if (!isQueryCandidate(*candidate)) continue;
+    auto cached = cache_.find(candidate->uuid());
+    auto plugIn = cached != cache_.end() ? cached->second : createPlugInForProxy(candidate);
+    if (plugIn && seen.insert(*plugIn->uuid()).second) plugIns->push_back(std::move(plugIn));
+  }
+  if (resolved_.size() == kResolvedLists) resolved_.erase(resolved_.begin());
+  resolved_.push_back({std::move(candidates), plugIns});
+  return plugIns;
 }
 
 bool AXDatabase::isQueryCandidate(const registrum::PlugInRecord& candidate) {
@@ -153,7 +163,7 @@ registrum::Workspace::Filter AXDatabase::electionFilter(const value::Dictionary&
   if (!elections) return nullptr;
   // One snapshot of the table for the whole query: the filter runs off _sync while elections
   // may be written on it, and the table is immutable once copied.
-  value::Dictionary table = _sync.sync([&] { return annotations_->annotations(); });
+  value::Dictionary table = annotationTable();
   return [elections = std::move(*elections), table](const std::string& identifier,
                                                     const value::Dictionary& entitlements) {
     const value::Value* replaced = entitlements.find(AXDNames::kReplacePlugInEntitlement);
@@ -175,6 +185,10 @@ std::optional<AXError> AXDatabase::removePlugIn(const std::string& path) {
   os::Status removed = workspace_->unregisterPlugIn(path);
   if (removed.ok()) return std::nullopt;
   return AXMakeError(AXProtocol::kRegistryRefused, "Registrum failed to deregister the plug-in");
+}
+
+value::Dictionary AXDatabase::annotationTable() {
+  return _sync.sync([&] { return annotations_->annotations(); });
 }
 
 std::optional<value::Dictionary> AXDatabase::annotationForPlugIn(const AXDPlugIn& plugIn) {
@@ -215,6 +229,7 @@ void AXDatabase::pluginsWillUninstall(const registrum::PlugInList& plugIns) {
           {text(record->bundleIdentifier()), text(record->plugInIdentifier()),
            text(record->bundleVersion()), record->uuid().string(), text(record->bundlePath())});
       cache_.erase(record->uuid());
+      resolved_.clear();
     }
   });
   if (auto delegate = delegate_.lock()) delegate->removedPlugIns(plugIns);

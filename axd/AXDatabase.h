@@ -68,7 +68,9 @@ class AXDatabase : public registrum::Observer, public std::enable_shared_from_th
   // known bundle) for an absent or empty rule; otherwise the registry's pre-selection restricted
   // by the rule's "QSUserElection" entry. Each record once, in the registry's order. Nothing
   // when the registry fails.
-  std::optional<PlugIns> findPlugIns(const std::optional<value::Dictionary>& rule);
+  // Null when the registry fails. The list is shared and never changed: the same list object
+  // serves every discovery while the registry and the cache stay as they are.
+  std::shared_ptr<const PlugIns> findPlugIns(const std::optional<value::Dictionary>& rule);
 
   // ---- Registration (an error of code 2 when the registry refuses) ----------------------------
 
@@ -77,6 +79,9 @@ class AXDatabase : public registrum::Observer, public std::enable_shared_from_th
 
   // ---- Annotations and elections --------------------------------------------------------------
 
+  // Every annotation by annotation key (AXDAnnotationStore::annotations), as it stands now: a
+  // request that needs many takes them at once. Takes _sync.
+  value::Dictionary annotationTable();
   // The annotation of |plugIn|, or nothing. Takes _sync.
   std::optional<value::Dictionary> annotationForPlugIn(const AXDPlugIn& plugIn);
   // Merges |annotation| into the plug-in's annotation (nothing removes it), saves the file, and
@@ -116,6 +121,9 @@ class AXDatabase : public registrum::Observer, public std::enable_shared_from_th
 
   // Whether the registry candidate belongs in a query result; logs an inconsistent registry.
   static bool isQueryCandidate(const registrum::PlugInRecord& candidate);
+  // The records of the registry's |candidates| that belong in a query result, each once, in
+  // order; from the cache, else built. On _sync.
+  std::shared_ptr<const PlugIns> resolve(registrum::PlugInList candidates);
   registrum::Workspace::Filter electionFilter(const value::Dictionary& rule);
 
   std::uint32_t cacheLimit_ = 0;
@@ -124,4 +132,14 @@ class AXDatabase : public registrum::Observer, public std::enable_shared_from_th
   std::shared_ptr<registrum::Workspace> workspace_;
   std::unique_ptr<AXDAnnotationStore> annotations_;
   Cache cache_;
+  // The lists resolve() made lately, with the registry lists they were made from: while the
+  // registry hands out the same records (it keeps its lists while nothing changed) and the cache
+  // stays as it was, a discovery takes its list as it is, without a lookup per record. Emptied
+  // whenever the cache changes; on _sync.
+  struct Resolved {
+    registrum::PlugInList candidates;
+    std::shared_ptr<const PlugIns> plugIns;
+  };
+  static constexpr std::size_t kResolvedLists = 8;
+  std::vector<Resolved> resolved_;
 };

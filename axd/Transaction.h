@@ -8,12 +8,12 @@
 #include <vector>
 
 #include "Annexa/AXError.h"
+#include "axd/AXDPlugIn.h"
 #include "platform/value/Value.h"
 #include "platform/zyn/Message.h"
 #include "platform/zyn/Reply.h"
 
 class AXDMatchList;
-class AXDPlugIn;
 class AXDPlugInHold;
 class AXDServer;
 class AXDZynClient;
@@ -82,15 +82,17 @@ class Transaction {
     std::uint64_t flags = 0;
     bool all = false;
     std::optional<value::Value> exclusions;
+    // The user's annotations by annotation key when the discovery began.
+    value::Dictionary annotations;
     // The active holds when the discovery began.
     std::vector<std::shared_ptr<AXDPlugInHold>> holds;
     // The boot key that signs the forms' read extensions, read once for the whole discovery;
     // nothing (logged) when it cannot be read, and the forms then carry no tokens.
-    std::optional<std::string> key;
+    AXDPlugIn::SealingKey key;
   };
 
   // The boot key for this discovery's tokens; nothing, logged, when it cannot be read.
-  std::optional<std::string> bootKey();
+  AXDPlugIn::SealingKey bootKey();
   // True when the client may discover with AXDiscoverAll: it has the manager entitlement and,
   // asked only then, runs outside any sandbox (a sandbox that cannot be asked counts as one).
   bool mayDiscoverAll();

@@ -30,13 +30,15 @@ void Transaction::matchPlugIns() {
   }
   discovery.exclusions = server()->userPrefs().exclusions();
   discovery.holds = server()->holds();
+  discovery.annotations = server()->annotationTable();
   discovery.key = bootKey();
   auto matches = std::make_shared<AXDMatchList>(discovery.flags, discovery.key);
   // A registry that cannot answer leaves nothing to discover; findPlugIns has logged why.
-  AXDatabase::PlugIns candidates =
-      server()->findPlugIns(discovery.rule).value_or(AXDatabase::PlugIns{});
-  os::Probes::discoverRaw(static_cast<unsigned>(candidates.size()));
-  for (const auto& plugIn : candidates) considerCandidate(*plugIn, discovery, *matches);
+  std::shared_ptr<const AXDatabase::PlugIns> candidates = server()->findPlugIns(discovery.rule);
+  if (!candidates) candidates = std::make_shared<const AXDatabase::PlugIns>();
+  os::Probes::discoverRaw(static_cast<unsigned>(candidates->size()));
+  matches->reserve(candidates->size());
+  for (const auto& plugIn : *candidates) considerCandidate(*plugIn, discovery, *matches);
   // The forms go out as the plug-ins keep them encoded, inside the envelope that
   // AXDaemonClient::convertToZyn gives the list; older protocol versions get no list.
   if (version_ == AXProtocol::kCurrentVersion) {
@@ -51,11 +53,11 @@ void Transaction::matchPlugIns() {
   done();
 }
 
-std::optional<std::string> Transaction::bootKey() {
+AXDPlugIn::SealingKey Transaction::bootKey() {
   os::Result<std::string> key = sandbox::BootKey::load();
-  if (key.ok()) return key.value();
+  if (key.ok()) return server()->sealingKey(std::move(key).value());
   server()->log("cannot read the key of read extensions: %@", {key.error().message});
-  return std::nullopt;
+  return nullptr;
 }
 
 bool Transaction::mayDiscoverAll() {
@@ -83,7 +85,9 @@ void Transaction::considerCandidate(const AXDPlugIn& plugIn, const Discovery& di
   }
   // Exporting cannot fail, so the cheaper deduplication goes first.
   if (!matches.admit(plugIn)) return;
-  matches.append(plugIn, server()->annotationForPlugIn(plugIn).value_or(value::Dictionary()));
+  const value::Value* annotation = discovery.annotations.find(plugIn.annotationKey());
+  static const value::Value kNoAnnotation = value::Value::dictionary({});
+  matches.append(plugIn, annotation && annotation->asDictionary() ? *annotation : kNoAnnotation);
 }
 
 bool Transaction::hiddenFromClient(const AXDPlugIn& plugIn, const Discovery& discovery) {

@@ -19,7 +19,7 @@ namespace {
 
 constexpr std::size_t kReadChunk = 64 * 1024;
 // The largest frame buffer a writing thread keeps between frames.
-constexpr std::size_t kKeptWriteBuffer = 1u << 20;
+constexpr std::size_t kKeptWriteBuffer = 64u << 20;
 
 ServiceError invalidError(const std::string& why) {
   return ServiceError{ErrorKind::ConnectionInvalid, "Connection invalid: " + why};
@@ -308,8 +308,7 @@ os::Status Connection::write(FrameKind kind, std::uint64_t id, const value::Valu
 
 os::Status Connection::write(FrameKind kind, std::uint64_t id, const ItemWriter& writeItem) {
   // Frames are encoded into a buffer kept by the writing thread, so a large reply neither grows
-  // a new vector step by step nor faults in fresh pages each time; only what the socket does
-  // not take at once is copied to the backlog.
+  // a new vector step by step nor faults in fresh pages each time.
   thread_local std::vector<std::uint8_t> bytes;
   bytes.clear();
   struct Trim {
@@ -331,11 +330,11 @@ os::Status Connection::write(FrameKind kind, std::uint64_t id, const ItemWriter&
   if (closed_) return os::success();
   std::size_t offset = 0;
   if (backlog_.empty() && sendNow(bytes, offset)) return os::success();
-  std::vector<std::uint8_t> rest = std::move(spare_);
-  rest.assign(bytes.begin() + static_cast<std::ptrdiff_t>(offset), bytes.end());
-  if (backlog_.empty()) backlogOffset_ = 0;
-  backlogBytes_ += rest.size();
-  backlog_.push_back(std::move(rest));
+  if (backlog_.empty()) backlogOffset_ = offset;
+  backlogBytes_ += bytes.size();
+  // The frame's buffer goes to the backlog as it is, and this thread takes the connection's
+  // spare in its place: nothing is copied.
+  backlog_.push_back(std::exchange(bytes, std::move(spare_)));
   if (backlog_.size() > 1 && backlogBytes_ > kMaxBacklogBytes) {
     os::Log::write(4, os::format("disconnecting %@: more than %zu bytes wait to be sent",
                                  {description(), kMaxBacklogBytes}));

@@ -60,13 +60,13 @@ class AXDMatchListTest : public ::testing::Test {
   // writes them; |labels| gets the index of each form's copy.
   static value::Array discover(std::uint64_t flags, const std::vector<Copy>& copies,
                                std::vector<std::int64_t>* labels = nullptr) {
-    AXDMatchList list(flags, std::nullopt);
+    AXDMatchList list(flags, nullptr);
     std::vector<std::shared_ptr<AXDPlugIn>> offered;
     std::map<std::string, std::int64_t> labelOfUuid;
     for (std::size_t i = 0; i < copies.size(); ++i) {
       offered.push_back(record(copies[i]));
       labelOfUuid[offered.back()->uuid()->string()] = static_cast<std::int64_t>(i);
-      if (list.admit(*offered.back())) list.append(*offered.back(), {});
+      if (list.admit(*offered.back())) list.append(*offered.back(), Value::dictionary({}));
     }
     std::vector<std::uint8_t> bytes;
     list.linkOverrides();
@@ -159,10 +159,10 @@ TEST_F(AXDMatchListTest, WritesEachFormAsItsValueEncodes) {
   std::vector<std::shared_ptr<AXDPlugIn>> plugIns = {
       record({.identifier = "a"}), record({.identifier = "r", .replaces = S("a")})};
   const value::Dictionary annotation{{"election", Value::integer(1)}};
-  AXDMatchList list(0, std::string(32, 'k'));
+  AXDMatchList list(0, std::make_shared<const std::string>(32, 'k'));
   for (const auto& plugIn : plugIns) {
     ASSERT_TRUE(list.admit(*plugIn));
-    list.append(*plugIn, annotation);
+    list.append(*plugIn, Value::dictionary(annotation));
   }
   list.linkOverrides();
   std::vector<std::uint8_t> written;
