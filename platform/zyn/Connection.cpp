@@ -19,7 +19,7 @@ namespace {
 
 constexpr std::size_t kReadChunk = 64 * 1024;
 // The largest frame buffer a writing thread keeps between frames.
-constexpr std::size_t kKeptWriteBuffer = 64u << 20;
+constexpr std::size_t kKeptWriteBuffer = 1u << 20;
 
 ServiceError invalidError(const std::string& why) {
   return ServiceError{ErrorKind::ConnectionInvalid, "Connection invalid: " + why};
