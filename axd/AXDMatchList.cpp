@@ -4,12 +4,13 @@
 
 #include "Annexa/AXProtocol.h"
 #include "Annexa/AXUtilities.h"
-#include "axd/AXDPlugIn.h"
 #include "platform/value/CborCodec.h"
 
-void AXDMatchList::reserve(std::size_t count) {
-  kept_.reserve(count);
-  byIdentifier_.reserve(count);
+AXDMatchList::AXDMatchList(std::uint64_t flags, AXDPlugIn::SealingKey key,
+                           std::shared_ptr<const Records> candidates)
+    : flags_(flags), key_(std::move(key)), candidates_(std::move(candidates)) {
+  kept_.reserve(candidates_->size());
+  byIdentifier_.reserve(candidates_->size());
 }
 
 bool AXDMatchList::admit(const AXDPlugIn& plugIn) {
@@ -65,13 +66,25 @@ void AXDMatchList::append(const AXDPlugIn& plugIn, value::Value annotation) {
   }
 }
 
-void AXDMatchList::write(std::vector<std::uint8_t>& out) const {
-  std::size_t live = 0;
-  for (const Kept& kept : kept_) live += kept.removed ? 0 : 1;
-  value::CborCodec::encodeArrayHead(live, out);
-  for (const Kept& kept : kept_) {
-    if (!kept.removed) writeForm(kept, out);
+void AXDMatchList::finish() {
+  linkOverrides();
+  std::vector<std::uint8_t> scratch;
+  for (std::size_t at = 0; at < kept_.size(); ++at) {
+    Kept& kept = kept_[at];
+    if (kept.removed) continue;
+    live_.push_back(at);
+    if (kept.overrider || kept.overriding) {
+      kept.changed = changedForm(kept);
+      size_ += kept.changed.size();
+      continue;
+    }
+    scratch.clear();
+    value::CborCodec::encode(kept.annotation, scratch);
+    size_ += kept.form->sizeWith(scratch.size());
   }
+  scratch.clear();
+  writeHead(scratch);
+  size_ += scratch.size();
 }
 
 void AXDMatchList::linkOverrides() {
@@ -89,16 +102,28 @@ void AXDMatchList::linkOverrides() {
   }
 }
 
-// The form as the plug-in keeps it encoded; one that an override changes is built afresh.
-void AXDMatchList::writeForm(const Kept& kept, std::vector<std::uint8_t>& out) const {
-  if (!kept.overrider && !kept.overriding) {
-    kept.form->encodeWith(kept.annotation, out);
-    return;
-  }
+std::vector<std::uint8_t> AXDMatchList::changedForm(const Kept& kept) const {
   std::optional<std::string> key = key_ ? std::optional(*key_) : std::nullopt;
   value::Dictionary form =
       kept.plugIn->augmentForm(kept.plugIn->exportForm(), key).with("annotations", kept.annotation);
   if (kept.overrider) form = form.with("overrider", *kept.overrider);
   if (kept.overriding) form = form.with("overriding", value::Value::string(*kept.overriding));
-  value::CborCodec::encode(value::Value::dictionary(form), out);
+  std::vector<std::uint8_t> encoded;
+  value::CborCodec::encode(value::Value::dictionary(form), encoded);
+  return encoded;
+}
+
+void AXDMatchList::writeHead(std::vector<std::uint8_t>& out) const {
+  value::CborCodec::encodeTag(value::CborCodec::kTagEnvelope, out);
+  value::CborCodec::encodeArrayHead(live_.size(), out);
+}
+
+void AXDMatchList::writePart(std::size_t part, std::vector<std::uint8_t>& out) const {
+  if (part == 0) return writeHead(out);
+  const Kept& kept = kept_[live_[part - 1]];
+  if (!kept.changed.empty()) {
+    out.insert(out.end(), kept.changed.begin(), kept.changed.end());
+    return;
+  }
+  kept.form->encodeWith(kept.annotation, out);
 }

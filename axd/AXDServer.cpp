@@ -3,11 +3,13 @@
 #include <unistd.h>
 
 #include <asio/post.hpp>
+#include <chrono>
 
 #include "axd/AXDNames.h"
 #include "axd/AXDZynClient.h"
 #include "platform/launcher/ServiceLauncher.h"
 #include "platform/os/Log.h"
+#include "platform/sandbox/BootKey.h"
 
 namespace {
 
@@ -51,8 +53,26 @@ std::shared_ptr<AXDServer> AXDServer::initForService(const char* serviceName,
 }
 
 void AXDServer::run() {
-  service_->resume();
+  warmUp();
+  os::Status listening = service_->resume();
+  if (!listening.ok()) {
+    os::Log::write(3, listening.error().message);
+    return;
+  }
   for (;;) pause();
+}
+
+void AXDServer::warmUp() {
+  auto start = std::chrono::steady_clock::now();
+  std::shared_ptr<const PlugIns> plugIns = findPlugIns(std::nullopt);
+  if (!plugIns || plugIns->size() > cacheLimit()) return;
+  os::Result<std::string> key = sandbox::BootKey::load();
+  AXDPlugIn::SealingKey sealing = key.ok() ? sealingKey(std::move(key).value()) : nullptr;
+  for (const auto& plugIn : *plugIns) plugIn->discoveryForm(sealing);
+  auto elapsed = std::chrono::duration_cast<std::chrono::milliseconds>(
+      std::chrono::steady_clock::now() - start);
+  os::Log::notice("built %d plug-in records in %d ms",
+                  {plugIns->size(), static_cast<std::int64_t>(elapsed.count())});
 }
 
 std::shared_ptr<AXDServer> AXDServer::server() {

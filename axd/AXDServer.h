@@ -36,8 +36,13 @@ class AXDServer : public AXDatabase, public AXDatabaseDelegate {
   static std::shared_ptr<AXDServer> initForService(const char* serviceName,
                                                    const char* databasePath);
 
-  // Accepts clients and keeps the process alive; does not return.
+  // Builds the record and discovery form of every installed plug-in (as many as the cache
+  // holds), then listens, accepts clients and keeps the process alive. Returns only when the
+  // socket cannot listen (logged).
   void run();
+  // The first step of run(): the records and forms that the first discovery would otherwise
+  // build while its host waits. Logs how many and how long.
+  void warmUp();
 
   // The shared server: the one built by initForService(), never cleared.
   static std::shared_ptr<AXDServer> server();

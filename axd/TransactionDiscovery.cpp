@@ -11,7 +11,6 @@
 #include "platform/os/Probes.h"
 #include "platform/sandbox/BootKey.h"
 #include "platform/sandbox/Sandbox.h"
-#include "platform/value/CborCodec.h"
 
 void Transaction::matchPlugIns() {
   Discovery discovery;
@@ -32,23 +31,18 @@ void Transaction::matchPlugIns() {
   discovery.holds = server()->holds();
   discovery.annotations = server()->annotationTable();
   discovery.key = bootKey();
-  auto matches = std::make_shared<AXDMatchList>(discovery.flags, discovery.key);
   // A registry that cannot answer leaves nothing to discover; findPlugIns has logged why.
   std::shared_ptr<const AXDatabase::PlugIns> candidates = server()->findPlugIns(discovery.rule);
   if (!candidates) candidates = std::make_shared<const AXDatabase::PlugIns>();
   os::Probes::discoverRaw(static_cast<unsigned>(candidates->size()));
-  matches->reserve(candidates->size());
+  auto matches = std::make_shared<AXDMatchList>(discovery.flags, discovery.key, candidates);
   for (const auto& plugIn : *candidates) considerCandidate(*plugIn, discovery, *matches);
-  // The forms go out as the plug-ins keep them encoded, inside the envelope that
-  // AXDaemonClient::convertToZyn gives the list; older protocol versions get no list.
+  // The forms go out as the plug-ins keep them encoded, a piece at a time as the client reads,
+  // inside the envelope that AXDaemonClient::convertToZyn gives the list; older protocol
+  // versions get no list.
   if (version_ == AXProtocol::kCurrentVersion) {
-    matches->linkOverrides();
-    // The list refers to the candidates' records, which the writer keeps alive.
-    reply_.setEncoded(AXProtocol::kMatches, [matches, candidates = std::move(candidates)](
-                                                std::vector<std::uint8_t>& out) {
-      value::CborCodec::encodeTag(value::CborCodec::kTagEnvelope, out);
-      matches->write(out);
-    });
+    matches->finish();
+    reply_.setStreamed(AXProtocol::kMatches, std::move(matches));
   }
   done();
 }

@@ -59,5 +59,5 @@ int main(int argc, char** argv) {
   server->setVerbose(verbose);
   server->setCacheLimit(static_cast<std::uint32_t>(cacheLimit));
   server->run();
-  return 0;
+  return 1;
 }

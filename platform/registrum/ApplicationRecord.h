@@ -18,6 +18,8 @@ class ApplicationRecord {
     std::optional<std::string> bundleVersion;
     std::optional<std::string> localizedName;
     bool placeholder = false;
+
+    bool operator==(const Fields&) const = default;
   };
 
   explicit ApplicationRecord(Fields fields) : fields_(std::move(fields)) {}

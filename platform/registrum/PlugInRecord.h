@@ -34,6 +34,9 @@ class PlugInRecord {
     std::optional<std::string> bundleVersion;
     std::optional<std::string> plugInVersion;
     std::optional<std::string> extensionPointIdentifier;
+    // The extension point queries pre-select on, as stored with the row; nothing in a record
+    // built by hand.
+    std::optional<std::string> rulePoint;
     value::Dictionary entitlements;
     double registrationDate = 0;
     bool onSystemPartition = false;
@@ -50,6 +53,10 @@ class PlugInRecord {
   // Assigned at the first registration of the bundle's path; kept while that path stays
   // registered, re-registrations included.
   const value::Uuid& uuid() const { return fields_.uuid; }
+  // The extension point the registry pre-selects the plug-in by: the bundle's own manifest
+  // value "QSExtensionPointIdentifier", before SDK merging; nothing when it declares none (such
+  // a plug-in is a candidate for every point).
+  const std::optional<std::string>& rulePoint() const { return fields_.rulePoint; }
   // The bundle location: canonical path of the bundle directory. Always present for records
   // the registry makes; nothing only in records built by hand (tests, fakes).
   const std::optional<std::string>& bundlePath() const { return fields_.bundlePath; }

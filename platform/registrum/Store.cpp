@@ -18,10 +18,11 @@ namespace {
 // Plug-in columns 0-6, then the application's columns 7-11 (all NULL without one).
 constexpr const char* kPlugInSelect =
     "SELECT p.uuid, p.path, p.registration_date, p.on_system_partition, p.data_container, "
-    "p.entitlements, p.info, "
+    "p.entitlements, p.info, p.rule_point, "
     "a.path, a.bundle_identifier, a.bundle_version, a.localized_name, a.placeholder "
     "FROM plugins p LEFT JOIN applications a ON a.path = p.application_path ";
-constexpr int kApplicationColumn = 7;
+constexpr int kRulePointColumn = 7;
+constexpr int kApplicationColumn = 8;
 
 constexpr const char* kKeySelect = "SELECT uuid, path, data_container FROM plugins ";
 
@@ -138,9 +139,26 @@ os::Result<PlugInList> Store::plugIns(const Selection& selection) {
   auto key =
       std::tuple(selection.plugInIdentifier, selection.rulePoint, selection.excludePlaceholders);
   if (auto kept = snapshot_.lists.find(key); kept != snapshot_.lists.end()) return kept->second;
-  os::Result<PlugInList> read = readPlugIns(selection);
+  std::optional<PlugInList> derived = selectKept(selection);
+  os::Result<PlugInList> read =
+      derived ? os::Result<PlugInList>(std::move(*derived)) : readPlugIns(selection);
   if (read.ok()) snapshot_.lists.emplace(std::move(key), read.value());
   return read;
+}
+
+std::optional<PlugInList> Store::selectKept(const Selection& selection) const {
+  if (selection.plugInIdentifier) return std::nullopt;
+  auto every = snapshot_.lists.find(decltype(snapshot_.lists)::key_type(
+      std::nullopt, std::nullopt, selection.excludePlaceholders));
+  if (every == snapshot_.lists.end()) return std::nullopt;
+  PlugInList selected;
+  for (const auto& record : every->second) {
+    const std::optional<std::string>& point = record->rulePoint();
+    if (!selection.rulePoint || !point || *point == *selection.rulePoint) {
+      selected.push_back(record);
+    }
+  }
+  return selected;
 }
 
 os::Result<PlugInList> Store::readPlugIns(const Selection& selection) {
@@ -307,11 +325,13 @@ os::Result<std::shared_ptr<const PlugInRecord>> Store::onePlugIn(const std::stri
 os::Result<PlugInList> Store::plugInRows(Statement& statement) {
   std::uint64_t sdkGeneration = sdks_->refresh();
   PlugInList plugIns;
+  std::shared_ptr<const ApplicationRecord> application;
   for (;;) {
     os::Result<bool> row = statement.step();
     if (!row.ok()) return row.error();
     if (!row.value()) return plugIns;
-    os::Result<std::shared_ptr<const PlugInRecord>> record = plugInRow(statement, sdkGeneration);
+    os::Result<std::shared_ptr<const PlugInRecord>> record =
+        plugInRow(statement, sdkGeneration, &application);
     if (record.ok()) {
       plugIns.push_back(std::move(record.value()));
     } else {
@@ -343,8 +363,9 @@ void Store::reportDamaged(const std::string& uuid, const os::Error& error) {
                                   "its bundle again)");
 }
 
-os::Result<std::shared_ptr<const PlugInRecord>> Store::plugInRow(const Statement& row,
-                                                                 std::uint64_t sdkGeneration) {
+os::Result<std::shared_ptr<const PlugInRecord>> Store::plugInRow(
+    const Statement& row, std::uint64_t sdkGeneration,
+    std::shared_ptr<const ApplicationRecord>* previous) {
   PlugInRecord::Fields fields;
   std::string uuid = row.text(0) + " at " + row.text(1);
   std::optional<value::Uuid> parsed = value::Uuid::parse(row.text(0));
@@ -367,8 +388,15 @@ os::Result<std::shared_ptr<const PlugInRecord>> Store::plugInRow(const Statement
   }
   fields.plugInDictionary = *plugIn->asDictionary();
   fields.sdkGeneration = sdkGeneration;
+  fields.rulePoint = row.optionalText(kRulePointColumn);
   if (!row.isNull(kApplicationColumn)) {
     fields.containingApplication = applicationRow(row, kApplicationColumn);
+    // Rows come by path, so an application's plug-ins share the record read for the first.
+    if (previous && *previous && (*previous)->fields() == fields.containingApplication->fields()) {
+      fields.containingApplication = *previous;
+    } else if (previous) {
+      *previous = fields.containingApplication;
+    }
   }
   RecordFields::derive(fields);
   return std::make_shared<const PlugInRecord>(std::move(fields));

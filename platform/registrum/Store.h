@@ -103,6 +103,11 @@ class Store {
 
   os::Result<std::shared_ptr<const PlugInRecord>> onePlugIn(const std::string& where,
                                                             const std::string& key);
+  // The plug-ins |selection| admits, filtered from the kept list of every plug-in: a selection by
+  // extension point alone then costs a pass over records already read, not a query that decodes
+  // every row again. Nothing when no such list is kept, or the selection names an identifier,
+  // which the index answers faster.
+  std::optional<PlugInList> selectKept(const Selection& selection) const;
   // plugIns() read from the database.
   os::Result<PlugInList> readPlugIns(const Selection& selection);
   os::Result<PlugInList> plugInRows(Statement& statement);
@@ -110,8 +115,11 @@ class Store {
   // Logs |error| about a damaged row once per row and Store.
   void reportDamaged(const std::string& uuid, const os::Error& error);
   // The record of |row|, resolved against the SDKs of |sdkGeneration|.
-  os::Result<std::shared_ptr<const PlugInRecord>> plugInRow(const Statement& row,
-                                                            std::uint64_t sdkGeneration);
+  // |previous|, when given, is the application record of the row before; a row of the same
+  // application shares it, and it becomes this row's otherwise.
+  os::Result<std::shared_ptr<const PlugInRecord>> plugInRow(
+      const Statement& row, std::uint64_t sdkGeneration,
+      std::shared_ptr<const ApplicationRecord>* previous = nullptr);
   static std::shared_ptr<const ApplicationRecord> applicationRow(const Statement& row, int first);
 
   // The lists plugIns() returned, by selection, and what they were read at: reused while the

@@ -1,29 +1,32 @@
 #include "platform/value/EncodedDictionary.h"
 
-#include <utility>
-
 #include "platform/value/CborCodec.h"
 
 namespace value {
 
-EncodedDictionary::EncodedDictionary(const Dictionary& dictionary, std::string key)
-    : key_(std::move(key)) {
+EncodedDictionary::EncodedDictionary(const Dictionary& dictionary, std::string_view key) {
+  CborCodec::encodeMapHead(dictionary.find(key) ? dictionary.size() : dictionary.size() + 1,
+                           bytes_);
+  bool placed = false;
+  auto placeKey = [&] {
+    CborCodec::encodeText(key, bytes_);
+    valueAt_ = bytes_.size();
+    placed = true;
+  };
   for (const auto& [name, element] : dictionary) {
-    if (name == key_) continue;
-    CborCodec::encodeText(name, entries_);
-    CborCodec::encode(element, entries_);
-    if (name < key_) split_ = entries_.size();
-    ++count_;
+    if (!placed && name >= key) placeKey();
+    if (name == key) continue;
+    CborCodec::encodeText(name, bytes_);
+    CborCodec::encode(element, bytes_);
   }
-  entries_.shrink_to_fit();
+  if (!placed) placeKey();
+  bytes_.shrink_to_fit();
 }
 
 void EncodedDictionary::encodeWith(const Value& value, std::vector<std::uint8_t>& out) const {
-  CborCodec::encodeMapHead(count_ + 1, out);
-  out.insert(out.end(), entries_.begin(), entries_.begin() + static_cast<std::ptrdiff_t>(split_));
-  CborCodec::encodeText(key_, out);
+  out.insert(out.end(), bytes_.begin(), bytes_.begin() + static_cast<std::ptrdiff_t>(valueAt_));
   CborCodec::encode(value, out);
-  out.insert(out.end(), entries_.begin() + static_cast<std::ptrdiff_t>(split_), entries_.end());
+  out.insert(out.end(), bytes_.begin() + static_cast<std::ptrdiff_t>(valueAt_), bytes_.end());
 }
 
 }  // namespace value

@@ -18,8 +18,10 @@ namespace zyn {
 namespace {
 
 constexpr std::size_t kReadChunk = 64 * 1024;
-// The largest frame buffer a writing thread keeps between frames.
+// The largest frame buffer a writing thread or a connection keeps between frames.
 constexpr std::size_t kKeptWriteBuffer = 1u << 20;
+// How much of a streamed frame is put together at a time.
+constexpr std::size_t kPieceBytes = 256u << 10;
 
 ServiceError invalidError(const std::string& why) {
   return ServiceError{ErrorKind::ConnectionInvalid, "Connection invalid: " + why};
@@ -266,6 +268,10 @@ void Connection::deliver(Event event) {
 
 os::Status Connection::send(const Reply& reply) {
   if (!reply.expected()) return os::success();
+  if (reply.streamed()) {
+    return write(FrameKind::Reply,
+                 std::make_unique<FrameSource>(FrameKind::Reply, reply.id(), reply.segments()));
+  }
   return write(FrameKind::Reply, reply.id(),
                [&reply](std::vector<std::uint8_t>& item) { reply.encode(item); });
 }
@@ -330,22 +336,55 @@ os::Status Connection::write(FrameKind kind, std::uint64_t id, const ItemWriter&
   if (closed_) return os::success();
   std::size_t offset = 0;
   if (backlog_.empty() && sendNow(bytes, offset)) return os::success();
-  if (backlog_.empty()) backlogOffset_ = offset;
-  backlogBytes_ += bytes.size();
   // The frame's buffer goes to the backlog as it is, and this thread takes the connection's
   // spare in its place: nothing is copied.
-  backlog_.push_back(std::exchange(bytes, std::move(spare_)));
+  std::size_t size = bytes.size();
+  enqueue(Pending{std::exchange(bytes, std::move(spare_)), nullptr, size}, offset);
+  return os::success();
+}
+
+os::Status Connection::write(FrameKind kind, std::unique_ptr<FrameSource> source) {
+  if (!source->valid() || source->size() - 4 > limits_.maxFrameBytes) {
+    std::string size = source->valid() ? os::format("%zu bytes", {source->size() - 4})
+                                       : std::string("4 GiB or more");
+    return os::Error{EMSGSIZE, os::format("%s too large (%s, limit %zu)",
+                                          {kindName(kind), size, limits_.maxFrameBytes})};
+  }
+  std::lock_guard lock(writeMutex_);
+  if (closed_) return os::success();
+  const std::size_t size = source->size();
+  Pending pending{std::move(spare_), std::move(source), size};
+  std::size_t offset = 0;
+  // Pieces go out while the socket takes them; the one it does not take waits in the backlog
+  // with the rest of the frame.
+  while (backlog_.empty()) {
+    pending.bytes.clear();
+    pending.more->fill(pending.bytes, kPieceBytes);
+    offset = 0;
+    if (!sendNow(pending.bytes, offset)) break;
+    if (pending.more->done()) {
+      spare_ = std::move(pending.bytes);
+      return os::success();
+    }
+  }
+  enqueue(std::move(pending), offset);
+  return os::success();
+}
+
+void Connection::enqueue(Pending pending, std::size_t offset) {
+  if (backlog_.empty()) backlogOffset_ = offset;
+  backlogBytes_ += pending.accounted;
+  backlog_.push_back(std::move(pending));
   if (backlog_.size() > 1 && backlogBytes_ > kMaxBacklogBytes) {
     os::Log::write(4, os::format("disconnecting %@: more than %zu bytes wait to be sent",
                                  {description(), kMaxBacklogBytes}));
     shutdownSocket();
-    return os::success();
+    return;
   }
   if (!flushing_) {
     flushing_ = true;
     flushLater();
   }
-  return os::success();
 }
 
 void Connection::flushLater() {
@@ -359,15 +398,20 @@ void Connection::flushLater() {
 void Connection::flush() {
   std::lock_guard lock(writeMutex_);
   while (!closed_ && !backlog_.empty()) {
-    auto& front = backlog_.front();
-    if (!sendNow(front, backlogOffset_)) {
+    Pending& front = backlog_.front();
+    if (!sendNow(front.bytes, backlogOffset_)) {
       flushLater();
       return;
     }
-    backlogBytes_ -= front.size();
-    if (front.capacity() <= kKeptWriteBuffer) spare_ = std::move(front);
-    backlog_.pop_front();
     backlogOffset_ = 0;
+    if (front.more && !front.more->done()) {
+      front.bytes.clear();
+      front.more->fill(front.bytes, kPieceBytes);
+      continue;
+    }
+    backlogBytes_ -= front.accounted;
+    if (front.bytes.capacity() <= kKeptWriteBuffer) spare_ = std::move(front.bytes);
+    backlog_.pop_front();
   }
   flushing_ = false;
 }

@@ -15,6 +15,7 @@
 
 #include "platform/os/Process.h"
 #include "platform/zyn/Frame.h"
+#include "platform/zyn/FrameSource.h"
 #include "platform/zyn/Message.h"
 #include "platform/zyn/Reply.h"
 #include "platform/zyn/StrandQueue.h"
@@ -123,6 +124,19 @@ class Connection : public std::enable_shared_from_this<Connection> {
   using ItemWriter = std::function<void(std::vector<std::uint8_t>&)>;
   os::Status write(FrameKind kind, std::uint64_t id, const value::Value& body);
   os::Status write(FrameKind kind, std::uint64_t id, const ItemWriter& writeItem);
+  // Sends the frame of |source| a piece at a time.
+  os::Status write(FrameKind kind, std::unique_ptr<FrameSource> source);
+  // A frame waiting to be sent: |bytes| from backlogOffset_ on, then, for a streamed frame, the
+  // pieces |more| has not written yet. |accounted| is what it counts in backlogBytes_: the whole
+  // frame, as if it were held encoded.
+  struct Pending {
+    std::vector<std::uint8_t> bytes;
+    std::unique_ptr<FrameSource> more;
+    std::size_t accounted = 0;
+  };
+  // Queues |pending|, of which |offset| bytes were sent, behind the backlog and has it flushed;
+  // disconnects a peer whose backlog grows past kMaxBacklogBytes. Under writeMutex_.
+  void enqueue(Pending pending, std::size_t offset);
   void flushLater();
   void flush();
   bool sendNow(std::vector<std::uint8_t>& bytes, std::size_t& offset);
@@ -146,7 +160,7 @@ class Connection : public std::enable_shared_from_this<Connection> {
   std::atomic<std::uint64_t> nextId_{1};
 
   std::mutex writeMutex_;  // guards the socket's descriptor for writing and everything below
-  std::deque<std::vector<std::uint8_t>> backlog_;
+  std::deque<Pending> backlog_;
   std::size_t backlogOffset_ = 0;
   // The last sent backlog buffer, reused for the next one so that a client that takes large
   // replies does not cost fresh pages for each.

@@ -51,9 +51,7 @@ bool encodeFrame(FrameKind kind, std::uint64_t id,
                  const std::function<void(std::vector<std::uint8_t>&)>& writeItem,
                  std::vector<std::uint8_t>& out) {
   std::size_t start = out.size();
-  out.resize(start + kHeaderBytes);
-  out[start + kLengthBytes] = static_cast<std::uint8_t>(kind);
-  putBigEndian(&out[start + kLengthBytes + 1], id, 8);
+  encodeFrameHeader(kind, id, 0, out);
   writeItem(out);
   std::size_t length = out.size() - start - kLengthBytes;
   if (length > UINT32_MAX) {
@@ -61,6 +59,18 @@ bool encodeFrame(FrameKind kind, std::uint64_t id,
     return false;
   }
   putBigEndian(&out[start], length, kLengthBytes);
+  return true;
+}
+
+bool encodeFrameHeader(FrameKind kind, std::uint64_t id, std::size_t itemBytes,
+                       std::vector<std::uint8_t>& out) {
+  std::size_t length = kMinLength + itemBytes;
+  if (length > UINT32_MAX) return false;
+  std::size_t start = out.size();
+  out.resize(start + kHeaderBytes);
+  putBigEndian(&out[start], length, kLengthBytes);
+  out[start + kLengthBytes] = static_cast<std::uint8_t>(kind);
+  putBigEndian(&out[start + kLengthBytes + 1], id, 8);
   return true;
 }
 

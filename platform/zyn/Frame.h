@@ -53,6 +53,10 @@ bool encodeFrame(const Frame& frame, std::vector<std::uint8_t>& out);
 bool encodeFrame(FrameKind kind, std::uint64_t id,
                  const std::function<void(std::vector<std::uint8_t>&)>& writeItem,
                  std::vector<std::uint8_t>& out);
+// Appends the 13 bytes that come before an item of |itemBytes| bytes in a frame of |kind| and
+// |id|. False, with |out| as it was, when the frame would be 4 GiB or more.
+bool encodeFrameHeader(FrameKind kind, std::uint64_t id, std::size_t itemBytes,
+                       std::vector<std::uint8_t>& out);
 
 // Incremental decoder over one connection's byte stream: the reader writes into prepare()'s
 // space, commits what it read, then takes frames with next() until it yields nothing. Bytes are

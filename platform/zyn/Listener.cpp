@@ -1,6 +1,7 @@
 #include "platform/zyn/Listener.h"
 
 #include <fcntl.h>
+#include <sys/file.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
@@ -73,10 +74,17 @@ os::Result<std::shared_ptr<Listener>> Listener::create(const std::string& servic
   if (!inherited.ok()) return inherited.error();
   std::string path;
   int fd = inherited.value();
+  int lock = -1;
   if (fd < 0) {
     path = os::Paths::zynSocketDir() + "/" + serviceName;
+    auto locked = lockService(path);
+    if (!locked.ok()) return locked.error();
+    lock = locked.value();
     auto bound = bindSocket(path);
-    if (!bound.ok()) return bound.error();
+    if (!bound.ok()) {
+      close(lock);
+      return bound.error();
+    }
     fd = bound.value();
   }
   // Connections made from now on inherit SO_PASSCRED, so even their first bytes carry the
@@ -86,6 +94,7 @@ os::Result<std::shared_ptr<Listener>> Listener::create(const std::string& servic
       fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) | O_NONBLOCK) != 0) {
     os::Error error = os::Error::fromErrno("cannot set up the listening socket");
     close(fd);
+    if (lock >= 0) close(lock);
     return error;
   }
   asio::local::stream_protocol::acceptor acceptor(Runtime::shared().context());
@@ -93,10 +102,11 @@ os::Result<std::shared_ptr<Listener>> Listener::create(const std::string& servic
   acceptor.assign(asio::local::stream_protocol(), fd, ec);
   if (ec) {
     close(fd);
+    if (lock >= 0) close(lock);
     return os::Error{ec.value(), "cannot adopt the listening socket: " + ec.message()};
   }
   return std::shared_ptr<Listener>(
-      new Listener(std::move(acceptor), serviceName, std::move(path), std::move(queue)));
+      new Listener(std::move(acceptor), serviceName, std::move(path), std::move(queue), lock));
 }
 
 os::Result<int> Listener::inheritedSocket() {
@@ -116,10 +126,24 @@ os::Result<int> Listener::inheritedSocket() {
   return kFirstInheritedFd;
 }
 
-os::Result<int> Listener::bindSocket(const std::string& path) {
+os::Result<int> Listener::lockService(const std::string& path) {
   // Another user who could write here could put a socket of theirs in the daemon's place.
   auto made = os::Paths::ensureRuntimeDirectory(os::Paths::zynSocketDir(), 0700);
   if (!made.ok()) return made.error();
+  const std::string lockPath = path + ".lock";
+  int fd = open(lockPath.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
+  if (fd < 0) return os::Error::fromErrno("cannot open " + lockPath);
+  if (flock(fd, LOCK_EX | LOCK_NB) != 0) {
+    os::Error error = errno == EWOULDBLOCK
+                          ? os::Error{EADDRINUSE, "another process already serves " + path}
+                          : os::Error::fromErrno("cannot lock " + lockPath);
+    close(fd);
+    return error;
+  }
+  return fd;
+}
+
+os::Result<int> Listener::bindSocket(const std::string& path) {
   auto address = socketAddress(path);
   if (!address.ok()) return address.error();
   if (somebodyListens(address.value())) {
@@ -129,9 +153,8 @@ os::Result<int> Listener::bindSocket(const std::string& path) {
   int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
   if (fd < 0) return os::Error::fromErrno("socket");
   const auto* raw = reinterpret_cast<const sockaddr*>(&address.value());
-  if (bind(fd, raw, sizeof address.value()) != 0 || chmod(path.c_str(), 0600) != 0 ||
-      listen(fd, SOMAXCONN) != 0) {
-    os::Error error = os::Error::fromErrno("cannot listen at " + path);
+  if (bind(fd, raw, sizeof address.value()) != 0 || chmod(path.c_str(), 0600) != 0) {
+    os::Error error = os::Error::fromErrno("cannot bind " + path);
     close(fd);
     return error;
   }
@@ -139,17 +162,27 @@ os::Result<int> Listener::bindSocket(const std::string& path) {
 }
 
 Listener::Listener(asio::local::stream_protocol::acceptor acceptor, std::string serviceName,
-                   std::string path, std::shared_ptr<SerialQueue> queue)
-    : acceptor_(std::move(acceptor)),
+                   std::string path, std::shared_ptr<SerialQueue> queue, int lock)
+    : lock_(lock),
+      acceptor_(std::move(acceptor)),
       retry_(Runtime::shared().context()),
       serviceName_(std::move(serviceName)),
       path_(std::move(path)),
       queue_(std::move(queue)),
       limits_(FrameLimits::fromEnvironment()) {}
 
-void Listener::resume() {
+Listener::~Listener() {
+  if (lock_ >= 0) close(lock_);
+}
+
+os::Status Listener::resume() {
+  // Listening again on an inherited socket only sets its backlog.
+  if (listen(acceptor_.native_handle(), SOMAXCONN) != 0) {
+    return os::Error::fromErrno("cannot listen on " + serviceName_);
+  }
   auto self = shared_from_this();
   asio::post(Runtime::shared().context(), [self] { self->acceptNext(); });
+  return os::success();
 }
 
 void Listener::acceptNext() {

@@ -4,9 +4,24 @@
 
 namespace zyn {
 
+namespace {
+
+void writeWhole(const ItemStream& stream, std::vector<std::uint8_t>& out) {
+  for (std::size_t part = 0; part < stream.parts(); ++part) stream.writePart(part, out);
+}
+
+}  // namespace
+
 const value::Value* Reply::find(const std::string& key) const {
   auto it = fields_.find(key);
   return it == fields_.end() ? nullptr : std::get_if<value::Value>(&it->second);
+}
+
+bool Reply::streamed() const {
+  for (const auto& entry : fields_) {
+    if (std::holds_alternative<std::shared_ptr<const ItemStream>>(entry.second)) return true;
+  }
+  return false;
 }
 
 value::Value Reply::body() const {
@@ -17,7 +32,7 @@ value::Value Reply::body() const {
       continue;
     }
     std::vector<std::uint8_t> item;
-    std::get<ItemWriter>(field)(item);
+    writeWhole(*std::get<std::shared_ptr<const ItemStream>>(field), item);
     auto decoded = value::CborCodec::decode(item);
     entries[key] = decoded.ok()
                        ? decoded.value()
@@ -33,9 +48,29 @@ void Reply::encode(std::vector<std::uint8_t>& out) const {
     if (const auto* v = std::get_if<value::Value>(&field)) {
       value::CborCodec::encode(*v, out);
     } else {
-      std::get<ItemWriter>(field)(out);
+      writeWhole(*std::get<std::shared_ptr<const ItemStream>>(field), out);
     }
   }
+}
+
+std::vector<FrameSource::Segment> Reply::segments() const {
+  std::vector<FrameSource::Segment> segments(1);
+  auto bytes = [&]() -> std::vector<std::uint8_t>& {
+    if (!std::holds_alternative<std::vector<std::uint8_t>>(segments.back())) {
+      segments.emplace_back(std::vector<std::uint8_t>());
+    }
+    return std::get<std::vector<std::uint8_t>>(segments.back());
+  };
+  value::CborCodec::encodeMapHead(fields_.size(), bytes());
+  for (const auto& [key, field] : fields_) {
+    value::CborCodec::encodeText(key, bytes());
+    if (const auto* v = std::get_if<value::Value>(&field)) {
+      value::CborCodec::encode(*v, bytes());
+    } else {
+      segments.emplace_back(std::get<std::shared_ptr<const ItemStream>>(field));
+    }
+  }
+  return segments;
 }
 
 }  // namespace zyn

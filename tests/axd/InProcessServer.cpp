@@ -47,7 +47,7 @@ void InProcessServer::SetUp() {
   built_ = AXDServer::initForService(kServiceName, nullptr);
   ASSERT_TRUE(built_) << "initForService failed";
   // What run() does before it parks the main thread for good.
-  built_->service()->resume();
+  ASSERT_TRUE(built_->service()->resume().ok());
 }
 
 void InProcessServer::TearDown() {

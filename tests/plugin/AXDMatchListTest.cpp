@@ -60,25 +60,34 @@ class AXDMatchListTest : public ::testing::Test {
   // writes them; |labels| gets the index of each form's copy.
   static value::Array discover(std::uint64_t flags, const std::vector<Copy>& copies,
                                std::vector<std::int64_t>* labels = nullptr) {
-    AXDMatchList list(flags, nullptr);
-    std::vector<std::shared_ptr<AXDPlugIn>> offered;
+    auto offered = std::make_shared<AXDMatchList::Records>();
     std::map<std::string, std::int64_t> labelOfUuid;
     for (std::size_t i = 0; i < copies.size(); ++i) {
-      offered.push_back(record(copies[i]));
-      labelOfUuid[offered.back()->uuid()->string()] = static_cast<std::int64_t>(i);
-      if (list.admit(*offered.back())) list.append(*offered.back(), Value::dictionary({}));
+      offered->push_back(record(copies[i]));
+      labelOfUuid[offered->back()->uuid()->string()] = static_cast<std::int64_t>(i);
     }
-    std::vector<std::uint8_t> bytes;
-    list.linkOverrides();
-    list.write(bytes);
-    auto decoded = value::CborCodec::decode(bytes);
-    EXPECT_TRUE(decoded.ok() && decoded.value().asArray());
-    if (!decoded.ok() || !decoded.value().asArray()) return {};
-    value::Array forms = *decoded.value().asArray();
+    AXDMatchList list(flags, nullptr, offered);
+    for (const auto& plugIn : *offered) {
+      if (list.admit(*plugIn)) list.append(*plugIn, Value::dictionary({}));
+    }
+    auto decoded = value::CborCodec::decode(written(list));
+    const Value* carried = decoded.ok() ? decoded.value().asEnvelope() : nullptr;
+    EXPECT_TRUE(carried && carried->asArray());
+    if (!carried || !carried->asArray()) return {};
+    value::Array forms = *carried->asArray();
     for (const Value& form : forms) {
       if (labels) labels->push_back(labelOfUuid[*form.asDictionary()->find("uuid")->asString()]);
     }
     return forms;
+  }
+
+  // Every part of the finished |list|, which must come to the size it announced.
+  static std::vector<std::uint8_t> written(AXDMatchList& list) {
+    list.finish();
+    std::vector<std::uint8_t> bytes;
+    for (std::size_t part = 0; part < list.parts(); ++part) list.writePart(part, bytes);
+    EXPECT_EQ(bytes.size(), list.size());
+    return bytes;
   }
 
   static std::vector<std::int64_t> labels(std::uint64_t flags, const std::vector<Copy>& copies) {
@@ -156,28 +165,27 @@ TEST_F(AXDMatchListTest, OverridesLinkTheReplacedAndTheReplacing) {
 // The forms go out as each plug-in keeps them encoded; the bytes must be those of the form
 // built as a value, with its annotation and override links, encoded whole.
 TEST_F(AXDMatchListTest, WritesEachFormAsItsValueEncodes) {
-  std::vector<std::shared_ptr<AXDPlugIn>> plugIns = {
-      record({.identifier = "a"}), record({.identifier = "r", .replaces = S("a")})};
+  auto plugIns = std::make_shared<AXDMatchList::Records>(
+      AXDMatchList::Records{record({.identifier = "a"}), record({.identifier = "b"}),
+                            record({.identifier = "r", .replaces = S("a")})});
   const value::Dictionary annotation{{"election", Value::integer(1)}};
-  AXDMatchList list(0, std::make_shared<const std::string>(32, 'k'));
-  for (const auto& plugIn : plugIns) {
+  AXDMatchList list(0, std::make_shared<const std::string>(32, 'k'), plugIns);
+  for (const auto& plugIn : *plugIns) {
     ASSERT_TRUE(list.admit(*plugIn));
     list.append(*plugIn, Value::dictionary(annotation));
   }
-  list.linkOverrides();
-  std::vector<std::uint8_t> written;
-  list.write(written);
 
-  auto form = [&](const AXDPlugIn& plugIn) {
+  auto form = [&](std::size_t i) {
+    const AXDPlugIn& plugIn = *(*plugIns)[i];
     return plugIn.augmentForm(plugIn.exportForm(), std::string(32, 'k'))
         .with("annotations", Value::dictionary(annotation));
   };
   value::Array expected = {
-      Value::dictionary(form(*plugIns[0]).with("overrider", S(plugIns[1]->uuid()->string()))),
-      Value::dictionary(form(*plugIns[1]).with("overriding", S("a")))};
+      Value::dictionary(form(0).with("overrider", S((*plugIns)[2]->uuid()->string()))),
+      Value::dictionary(form(1)), Value::dictionary(form(2).with("overriding", S("a")))};
   std::vector<std::uint8_t> encoded;
-  value::CborCodec::encode(Value::array(expected), encoded);
-  EXPECT_EQ(written, encoded);
+  value::CborCodec::encode(Value::envelope(Value::array(expected)), encoded);
+  EXPECT_EQ(written(list), encoded);
 }
 
 }  // namespace
