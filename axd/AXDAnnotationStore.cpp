@@ -127,7 +127,7 @@ std::optional<value::Dictionary> AXDAnnotationStore::annotationForPlugIn(
 
 std::optional<AXError> AXDAnnotationStore::setAnnotation(
     const std::optional<value::Dictionary>& annotation, const AXDPlugIn& plugIn) {
-  std::string key = plugIn.annotationKey();
+  const std::string& key = plugIn.annotationKey();
   value::Dictionary saved = annotations_;
   if (annotation) {
     std::map<std::string, value::Value> merged =

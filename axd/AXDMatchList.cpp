@@ -4,6 +4,7 @@
 
 #include "Annexa/AXProtocol.h"
 #include "Annexa/AXUtilities.h"
+#include "platform/os/Log.h"
 #include "platform/value/CborCodec.h"
 
 AXDMatchList::AXDMatchList(std::uint64_t flags, AXDPlugIn::SealingKey key,
@@ -14,7 +15,7 @@ AXDMatchList::AXDMatchList(std::uint64_t flags, AXDPlugIn::SealingKey key,
 }
 
 bool AXDMatchList::admit(const AXDPlugIn& plugIn) {
-  auto chain = byIdentifier_.find(plugIn.facts().identifier);
+  auto chain = byIdentifier_.find(plugIn.facts().identifierText());
   if (chain == byIdentifier_.end()) return true;
   for (std::size_t at = chain->second.first, before = kNone; at != kNone;
        before = at, at = kept_[at].next) {
@@ -53,7 +54,7 @@ bool AXDMatchList::prefersNew(const AXDPlugIn& plugIn, const AXDPlugIn& existing
 void AXDMatchList::append(const AXDPlugIn& plugIn, value::Value annotation) {
   const std::size_t position = kept_.size();
   kept_.push_back({&plugIn, plugIn.discoveryForm(key_), std::move(annotation)});
-  Chain& chain = byIdentifier_[plugIn.facts().identifier];
+  Chain& chain = byIdentifier_[plugIn.facts().identifierText()];
   (chain.last == kNone ? chain.first : kept_[chain.last].next) = position;
   chain.last = position;
   const std::optional<value::Value>& replaced = plugIn.facts().replaces;
@@ -91,7 +92,7 @@ void AXDMatchList::linkOverrides() {
   if (overrides_.empty()) return;
   for (Kept& kept : kept_) {
     if (kept.removed) continue;
-    const std::string& identifier = kept.plugIn->facts().identifier;
+    const std::string& identifier = kept.plugIn->facts().identifierText();
     auto entry = overrides_.find(identifier);
     if (entry == overrides_.end()) continue;
     Kept& replacing = kept_[entry->second];
@@ -103,12 +104,19 @@ void AXDMatchList::linkOverrides() {
 }
 
 std::vector<std::uint8_t> AXDMatchList::changedForm(const Kept& kept) const {
-  std::optional<std::string> key = key_ ? std::optional(*key_) : std::nullopt;
-  value::Dictionary form =
-      kept.plugIn->augmentForm(kept.plugIn->exportForm(), key).with("annotations", kept.annotation);
+  // Rare enough to go through values: the kept form decoded, the links added, encoded again.
+  std::vector<std::uint8_t> encoded;
+  kept.form->encodeWith(kept.annotation, encoded);
+  os::Result<value::Value> decoded = value::CborCodec::decode(encoded);
+  if (!decoded.ok() || !decoded.value().asDictionary()) {
+    os::Log::notice("cannot link overrides of plug-in %@: its form does not decode",
+                    {kept.plugIn->facts().identifierText()});
+    return encoded;
+  }
+  value::Dictionary form = *decoded.value().asDictionary();
   if (kept.overrider) form = form.with("overrider", *kept.overrider);
   if (kept.overriding) form = form.with("overriding", value::Value::string(*kept.overriding));
-  std::vector<std::uint8_t> encoded;
+  encoded.clear();
   value::CborCodec::encode(value::Value::dictionary(form), encoded);
   return encoded;
 }

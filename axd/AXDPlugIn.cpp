@@ -177,37 +177,35 @@ os::Result<std::string> resolveResource(const std::string& bundle, const std::st
 
 }  // namespace
 
-const std::optional<std::vector<AXDPlugIn::SharedResource>>& AXDPlugIn::sharedResources() const {
-  std::call_once(sharedResolved_, [this] {
-    std::optional<value::Value> listed = pluginKey("Shared");
-    // An app extension shares its whole bundle, whatever "Shared" lists.
-    if (isAppExtension()) listed = value::Value::array({value::Value::string(".")});
-    if (!listed) return;
-    value::Array names;
-    if (listed->asString()) names.push_back(*listed);
-    if (const value::Array* array = listed->asArray()) names = *array;
-    os::Result<std::string> bundle = os::Paths::canonical(path());
-    shared_.emplace();
-    for (const value::Value& element : names) {
-      const std::string* name = element.asString();
-      if (!name) continue;
-      os::Result<std::string> resolved =
-          bundle.ok() ? resolveResource(bundle.value(), *name) : bundle;
-      if (resolved.ok()) {
-        shared_->push_back({*name, resolved.value()});
-        continue;
-      }
-      std::string target = *name == "." ? path() : appendingPathComponent(AXFileURL(path()), *name);
-      os::Log::notice("failed to make extension for %@ in plug-in at %@: %s",
-                      {target, path(), std::strerror(resolved.error().errnum)});
+std::optional<std::vector<AXDPlugIn::SharedResource>> AXDPlugIn::sharedResources() const {
+  std::optional<value::Value> listed = pluginKey("Shared");
+  // An app extension shares its whole bundle, whatever "Shared" lists.
+  if (isAppExtension()) listed = value::Value::array({value::Value::string(".")});
+  if (!listed) return std::nullopt;
+  value::Array names;
+  if (listed->asString()) names.push_back(*listed);
+  if (const value::Array* array = listed->asArray()) names = *array;
+  os::Result<std::string> bundle = os::Paths::canonical(path());
+  std::vector<SharedResource> shared;
+  for (const value::Value& element : names) {
+    const std::string* name = element.asString();
+    if (!name) continue;
+    os::Result<std::string> resolved =
+        bundle.ok() ? resolveResource(bundle.value(), *name) : bundle;
+    if (resolved.ok()) {
+      shared.push_back({*name, resolved.value()});
+      continue;
     }
-  });
-  return shared_;
+    std::string target = *name == "." ? path() : appendingPathComponent(AXFileURL(path()), *name);
+    os::Log::notice("failed to make extension for %@ in plug-in at %@: %s",
+                    {target, path(), std::strerror(resolved.error().errnum)});
+  }
+  return shared;
 }
 
 value::Dictionary AXDPlugIn::augmentForm(const value::Dictionary& form,
                                          const std::optional<std::string>& key) const {
-  const std::optional<std::vector<SharedResource>>& shared = sharedResources();
+  std::optional<std::vector<SharedResource>> shared = sharedResources();
   if (!shared) return form;
   std::map<std::string, value::Value> extensions;
   for (const SharedResource& resource : key ? *shared : std::vector<SharedResource>()) {
@@ -252,21 +250,23 @@ bool AXDPlugIn::hasEntitlement(std::string_view name) const {
 }
 
 void AXDPlugIn::readFacts() {
-  facts_.identifier = identifier().value_or(std::string());
-  facts_.identifierValue = value::Value::string(facts_.identifier);
+  facts_.identifier = value::Value::string(identifier().value_or(std::string()));
   facts_.extensionPoint = manifestValue("QSExtensionPointIdentifier");
   facts_.version = version().value_or(std::string());
   facts_.onSystemVolume = onSystemVolume();
   facts_.contained = containingUrl().has_value();
-  facts_.lastModified = lastModified();
   facts_.dedicated = isDedicated();
+  facts_.lastModified = lastModified();
   facts_.replaces = valueForEntitlement(AXDNames::kReplacePlugInEntitlement);
   if (std::optional<value::Value> demand = pluginKey("QSExtensionHostEntitlement")) {
     const std::string* name = demand->asString();
     facts_.hostEntitlementDemand = name ? *name : std::string();
   }
+}
+
+const std::string& AXDPlugIn::annotationKey() const {
   const std::string* replaced = facts_.replaces ? facts_.replaces->asString() : nullptr;
-  facts_.annotationKey = replaced ? *replaced : facts_.identifier;
+  return replaced ? *replaced : facts_.identifierText();
 }
 
 value::Dictionary AXDPlugIn::prunedInfoDictionaryFor(const value::Dictionary& dictionary) {

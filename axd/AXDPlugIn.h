@@ -42,20 +42,22 @@ class AXDPlugIn : public AXPlugInCore {
   // What discovery asks of every candidate, read once when the record is built (the record
   // never changes afterwards), so a warm discovery neither locks nor copies per question.
   struct Facts {
-    std::string identifier;        // always present in a record made by initWithRGData
-    value::Value identifierValue;  // the same, as the rule language reads it
+    // The identifier as the rule language reads it: a string, always present in a record made
+    // by initWithRGData.
+    value::Value identifier;
     // The manifest's "QSExtensionPointIdentifier", the key hosts discover by, or absent.
     std::optional<value::Value> extensionPoint;
     std::string version;  // "" when the plug-in declares none
     bool onSystemVolume = false;
     bool contained = false;  // lies in an application
-    std::int32_t lastModified = 0;
     bool dedicated = false;  // AXPlugInCore::isDedicated
+    std::int32_t lastModified = 0;
     // The entitlement "<vendor prefix>.developer.replace-plugin", or absent.
     std::optional<value::Value> replaces;
-    // hostEntitlementDemand() and annotationKey(), below.
+    // hostEntitlementDemand(), below.
     std::optional<std::string> hostEntitlementDemand;
-    std::string annotationKey;
+
+    const std::string& identifierText() const { return *identifier.asString(); }
   };
   const Facts& facts() const { return facts_; }
 
@@ -97,12 +99,12 @@ class AXDPlugIn : public AXPlugInCore {
   };
   // The plug-in's shared resources: those of "Shared" (a string or an array of strings; other
   // elements are skipped), or of ["."], the whole bundle, for an app extension. "." names the
-  // bundle, anything else a path inside it. Resolved at the first call and kept, so discovery
-  // touches no file per plug-in: the record is rebuilt whenever the registry changes the
-  // plug-in. A resource that does not resolve, or resolves outside the bundle, is left out and
-  // logged once as "failed to make extension for <target> in plug-in at <path>: <strerror>".
-  // Nothing when the plug-in is not an app extension and has no "Shared".
-  const std::optional<std::vector<SharedResource>>& sharedResources() const;
+  // bundle, anything else a path inside it. Resolved afresh by each call: only building a
+  // discovery form asks, once per boot key. A resource that does not resolve, or resolves
+  // outside the bundle, is left out and logged as "failed to make extension for <target> in
+  // plug-in at <path>: <strerror>". Nothing when the plug-in is not an app extension and has no
+  // "Shared".
+  std::optional<std::vector<SharedResource>> sharedResources() const;
 
   // |form| with "extensions" set to a read-extension token for each shared resource, by name,
   // signed with |key|, the boot key read once for the whole request (empty without a key), even
@@ -130,7 +132,7 @@ class AXDPlugIn : public AXPlugInCore {
   // The key of the plug-in's annotations: the entitlement "<vendor prefix>.developer.replace-
   // plugin" when it is a string, else the identifier (always present in a record made by
   // initWithRGData).
-  const std::string& annotationKey() const { return facts_.annotationKey; }
+  const std::string& annotationKey() const;
 
   // ---- Matching rules (AXDPlugInMatching.cpp) -------------------------------------------------
 
@@ -223,6 +225,4 @@ class AXDPlugIn : public AXPlugInCore {
     std::shared_ptr<const value::EncodedDictionary> form;
   };
   mutable std::optional<DiscoveryForm> discoveryForm_;
-  mutable std::once_flag sharedResolved_;
-  mutable std::optional<std::vector<SharedResource>> shared_;
 };

@@ -62,7 +62,7 @@ bool AXDPlugIn::matchKey(const std::string& key, const value::Value& pattern) co
   if (key.starts_with(kEntitlementPrefix)) {
     found = valueForEntitlement(std::string_view(key).substr(kEntitlementPrefix.size()));
   } else if (key == "QSExtensionIdentifier") {
-    found = facts_.identifierValue;
+    found = facts_.identifier;
   } else if (key == "QSExtensionPointIdentifier") {
     found = facts_.extensionPoint;
   } else if (key == kUuidKey) {

@@ -73,7 +73,7 @@ void Transaction::considerCandidate(const AXDPlugIn& plugIn, const Discovery& di
   if (!discovery.all) {
     if (std::optional<std::string> refusal = plugIn.allowForClient(*client_)) {
       server()->debug("client %d cannot use plugin %@: %@",
-                      {client_->pid(), plugIn.facts().identifier, *refusal});
+                      {client_->pid(), plugIn.facts().identifierText(), *refusal});
       return;
     }
   }
