@@ -347,8 +347,11 @@ os::Status prepare(Installation& installation) {
   return os::success();
 }
 
-// EncodeReply stands for the daemon's encoding only while it makes the bytes the daemon sent.
-void checkEncoding(const Installation& installation) {
+// Says how large the full discovery's reply is. EncodeReply stands for the daemon's encoding only
+// while it makes the bytes the daemon sent; a note says when it does not.
+void describeReply(const Installation& installation) {
+  std::fprintf(stderr, "%zu plug-ins: a full discovery's reply frame is %.2f MB\n",
+               installation.plugIns, installation.everyReplyFrame.size() / 1e6);
   std::vector<std::uint8_t> again;
   zyn::encodeFrame(zyn::Frame{zyn::FrameKind::Reply, kMessageId, installation.everyReply}, again);
   if (again == installation.everyReplyFrame) return;
@@ -377,7 +380,7 @@ int main(int argc, char** argv) {
     installations.push_back({size, std::move(daemon).value(), path});
     os::Status prepared = prepare(installations.back());
     if (!prepared.ok()) return fail("cannot prepare the daemon", prepared.error());
-    checkEncoding(installations.back());
+    describeReply(installations.back());
   }
   registerCases(installations);
   benchmark::RunSpecifiedBenchmarks();
