@@ -34,9 +34,9 @@ std::optional<zyn::Frame> MatchFrames::decode(std::span<const std::uint8_t> byte
 }
 
 std::optional<std::size_t> MatchFrames::forms(const Value& body) {
+  // An error reply carries no list.
   const value::Dictionary* fields = body.asDictionary();
-  if (!fields || fields->find(AXProtocol::kErrorCode)) return std::nullopt;
-  const Value* matches = fields->find(AXProtocol::kMatches);
+  const Value* matches = fields ? fields->find(AXProtocol::kMatches) : nullptr;
   const Value* carried = matches ? matches->asEnvelope() : nullptr;
   const value::Array* list = carried ? carried->asArray() : nullptr;
   if (!list) return std::nullopt;
