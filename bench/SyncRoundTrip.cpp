@@ -18,10 +18,10 @@ bool succeeded(const zyn::ReplyOrError& reply) {
 
 // Sends through |send| and waits for what |judge| makes of the reply; nothing when the handler
 // was dropped unanswered.
-template <typename Result = std::size_t, typename Send, typename Judge>
-std::optional<Result> await(Send send, Judge judge) {
-  auto verdict = std::make_shared<std::promise<std::optional<Result>>>();
-  std::future<std::optional<Result>> arrived = verdict->get_future();
+template <typename Send, typename Judge>
+std::optional<std::size_t> await(Send send, Judge judge) {
+  auto verdict = std::make_shared<std::promise<std::optional<std::size_t>>>();
+  std::future<std::optional<std::size_t>> arrived = verdict->get_future();
   send([verdict, judge](const zyn::ReplyOrError& reply) { verdict->set_value(judge(reply)); });
   try {
     return arrived.get();
@@ -41,20 +41,6 @@ bool SyncRoundTrip::bulk(AXDaemonClient& client, std::uint64_t flags) {
     return 0;
   };
   return await(send, judge).has_value();
-}
-
-std::optional<value::Value> SyncRoundTrip::matchReply(AXDaemonClient& client,
-                                                      const std::optional<value::Dictionary>& rule,
-                                                      std::uint64_t flags) {
-  auto send = [&](AXDaemonClient::ReplyHandler handler) {
-    client.matchPlugIns(rule, flags, std::move(handler));
-  };
-  auto judge = [](const zyn::ReplyOrError& reply) -> std::optional<value::Value> {
-    const value::Value* body = std::get_if<value::Value>(&reply);
-    if (!body || !succeeded(reply)) return std::nullopt;
-    return *body;
-  };
-  return await<value::Value>(send, judge);
 }
 
 std::optional<std::size_t> SyncRoundTrip::match(AXDaemonClient& client,

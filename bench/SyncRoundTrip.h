@@ -20,9 +20,4 @@ class SyncRoundTrip {
   static std::optional<std::size_t> match(AXDaemonClient& client,
                                           const std::optional<value::Dictionary>& rule,
                                           std::uint64_t flags);
-  // The same request's reply as it came off the wire (the frame's item), or nothing when it was
-  // an error.
-  static std::optional<value::Value> matchReply(AXDaemonClient& client,
-                                                const std::optional<value::Dictionary>& rule,
-                                                std::uint64_t flags);
 };
