@@ -15,7 +15,7 @@ AXDMatchList::AXDMatchList(std::uint64_t flags, AXDPlugIn::SealingKey key,
 }
 
 bool AXDMatchList::admit(const AXDPlugIn& plugIn) {
-  auto chain = byIdentifier_.find(plugIn.facts().identifierText());
+  auto chain = byIdentifier_.find(identifierOf(plugIn));
   if (chain == byIdentifier_.end()) return true;
   for (std::size_t at = chain->second.first, before = kNone; at != kNone;
        before = at, at = kept_[at].next) {
@@ -25,6 +25,10 @@ bool AXDMatchList::admit(const AXDPlugIn& plugIn) {
     return *replaces;
   }
   return true;
+}
+
+AXDMatchList::Identifier AXDMatchList::identifierOf(const AXDPlugIn& plugIn) {
+  return {plugIn.facts().identifierHash, plugIn.facts().identifierText()};
 }
 
 void AXDMatchList::unlink(Chain& chain, std::size_t at, std::size_t before) {
@@ -53,8 +57,12 @@ bool AXDMatchList::prefersNew(const AXDPlugIn& plugIn, const AXDPlugIn& existing
 
 void AXDMatchList::append(const AXDPlugIn& plugIn, value::Value annotation) {
   const std::size_t position = kept_.size();
-  kept_.push_back({&plugIn, plugIn.discoveryForm(key_), std::move(annotation)});
-  Chain& chain = byIdentifier_[plugIn.facts().identifierText()];
+  auto form = plugIn.discoveryForm(key_);
+  scratch_.clear();
+  value::CborCodec::encode(annotation, scratch_);
+  std::size_t size = form->sizeWith(scratch_.size());
+  kept_.push_back({&plugIn, std::move(form), size, std::move(annotation)});
+  Chain& chain = byIdentifier_[identifierOf(plugIn)];
   (chain.last == kNone ? chain.first : kept_[chain.last].next) = position;
   chain.last = position;
   const std::optional<value::Value>& replaced = plugIn.facts().replaces;
@@ -69,7 +77,6 @@ void AXDMatchList::append(const AXDPlugIn& plugIn, value::Value annotation) {
 
 void AXDMatchList::finish() {
   linkOverrides();
-  std::vector<std::uint8_t> scratch;
   for (std::size_t at = 0; at < kept_.size(); ++at) {
     Kept& kept = kept_[at];
     if (kept.removed) continue;
@@ -79,11 +86,9 @@ void AXDMatchList::finish() {
       size_ += kept.changed.size();
       continue;
     }
-    scratch.clear();
-    value::CborCodec::encode(kept.annotation, scratch);
-    size_ += kept.form->sizeWith(scratch.size());
+    size_ += kept.size;
   }
-  scratch.clear();
+  std::vector<std::uint8_t> scratch;
   writeHead(scratch);
   size_ += scratch.size();
 }

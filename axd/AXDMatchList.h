@@ -66,6 +66,8 @@ class AXDMatchList : public zyn::ItemStream {
     const AXDPlugIn* plugIn;
     // The plug-in's kept form, taken while the record is at hand (AXDPlugIn::discoveryForm).
     std::shared_ptr<const value::EncodedDictionary> form;
+    // Its size with the annotation, read while the form is at hand.
+    std::size_t size = 0;
     value::Value annotation;
     bool removed = false;
     std::size_t next = kNone;  // the next live record of the same identifier
@@ -77,7 +79,8 @@ class AXDMatchList : public zyn::ItemStream {
 
   // The first and last live records of an identifier in kept_, linked through Kept::next in
   // order: the walk for a new record visits only its own identifier's, so a request costs
-  // linear time, not quadratic. Keys view the records' own identifiers.
+  // linear time, not quadratic. Keys view the records' own identifiers, hashed when the record
+  // was built (AXDPlugIn::Facts), so a new identifier is not read again.
   struct Chain {
     std::size_t first = kNone;
     std::size_t last = kNone;
@@ -102,9 +105,21 @@ class AXDMatchList : public zyn::ItemStream {
   const std::shared_ptr<const Records> candidates_;
   // Every plug-in in the order it was kept; a removed one stays, marked.
   std::vector<Kept> kept_;
-  std::unordered_map<std::string_view, Chain> byIdentifier_;  // see Chain
+  struct Identifier {
+    std::size_t hash;
+    std::string_view text;
+    bool operator==(const Identifier& other) const {
+      return hash == other.hash && text == other.text;
+    }
+  };
+  struct IdentifierHash {
+    std::size_t operator()(const Identifier& identifier) const { return identifier.hash; }
+  };
+  static Identifier identifierOf(const AXDPlugIn& plugIn);
+  std::unordered_map<Identifier, Chain, IdentifierHash> byIdentifier_;  // see Chain
   // Replaced identifier -> position in kept_ of the plug-in that names it.
   std::map<std::string, std::size_t> overrides_;
+  std::vector<std::uint8_t> scratch_;  // an annotation encoded, to learn its size
   // After finish(): the positions of the live records in kept_, and the item's size.
   std::vector<std::size_t> live_;
   std::size_t size_ = 0;

@@ -251,6 +251,7 @@ bool AXDPlugIn::hasEntitlement(std::string_view name) const {
 
 void AXDPlugIn::readFacts() {
   facts_.identifier = value::Value::string(identifier().value_or(std::string()));
+  facts_.identifierHash = std::hash<std::string_view>()(facts_.identifierText());
   facts_.extensionPoint = manifestValue("QSExtensionPointIdentifier");
   facts_.version = version().value_or(std::string());
   facts_.onSystemVolume = onSystemVolume();

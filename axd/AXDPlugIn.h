@@ -45,6 +45,7 @@ class AXDPlugIn : public AXPlugInCore {
     // The identifier as the rule language reads it: a string, always present in a record made
     // by initWithRGData.
     value::Value identifier;
+    std::size_t identifierHash = 0;  // std::hash of its text
     // The manifest's "QSExtensionPointIdentifier", the key hosts discover by, or absent.
     std::optional<value::Value> extensionPoint;
     std::string version;  // "" when the plug-in declares none

@@ -191,6 +191,8 @@ Value CborBuilder::finish(Open& open) {
       return Value::string(std::move(open.chunks));
     case Kind::Array:
       --depth_;
+      // Decoded values may live long (registry records): keep no room left over from growing.
+      open.elements.shrink_to_fit();
       return Value::array(std::move(open.elements));
     case Kind::Map:
       --depth_;

@@ -38,20 +38,26 @@ const Value* Dictionary::find(std::string_view key) const {
 }
 
 Dictionary Dictionary::with(std::string key, Value value) const {
-  auto entries = std::make_shared<std::vector<Entry>>(begin(), end());
-  auto it = std::lower_bound(entries->begin(), entries->end(), key, keyLess);
-  if (it != entries->end() && it->first == key) {
-    it->second = std::move(value);
-  } else {
-    entries->emplace(it, std::move(key), std::move(value));
-  }
+  // Built in order at its exact size: dictionaries live long, and a vector grown by one
+  // insertion would keep twice the room it needs.
+  auto entries = std::make_shared<std::vector<Entry>>();
+  entries->reserve(size() + 1);
+  auto at = std::lower_bound(begin(), end(), key, keyLess);
+  entries->insert(entries->end(), begin(), at);
+  entries->emplace_back(std::move(key), std::move(value));
+  if (at != end() && at->first == entries->back().first) ++at;
+  entries->insert(entries->end(), at, end());
+  entries->shrink_to_fit();
   return Dictionary(std::move(entries));
 }
 
 Dictionary Dictionary::without(std::string_view key) const {
-  auto entries = std::make_shared<std::vector<Entry>>(begin(), end());
-  auto it = std::lower_bound(entries->begin(), entries->end(), key, keyLess);
-  if (it != entries->end() && it->first == key) entries->erase(it);
+  auto at = std::lower_bound(begin(), end(), key, keyLess);
+  if (at == end() || at->first != key) return *this;
+  auto entries = std::make_shared<std::vector<Entry>>();
+  entries->reserve(size() - 1);
+  entries->insert(entries->end(), begin(), at);
+  entries->insert(entries->end(), at + 1, end());
   return Dictionary(std::move(entries));
 }
 
