@@ -232,6 +232,24 @@ TEST_F(DiscoveryTest, ANewBootKeySignsTheNextDiscoverysTokens) {
   EXPECT_EQ(sandbox::Sandbox::consume(before).error().errnum, EPERM);
 }
 
+// A daemon started on installed plug-ins builds their records before it listens; the first
+// discovery by an extension point takes its plug-ins from those records, and an install after
+// that counts at the next discovery.
+TEST_F(DiscoveryTest, TheRecordsBuiltAtStartServeTheFirstDiscoveryAndAnInstallCountsNext) {
+  auto at = [](const char* point) {
+    return Dictionary{{"QSExtensionPointIdentifier", Value::string(point)}};
+  };
+  add({inApp("Points", {.id = "a.one", .extension = at("point.a")}),
+       inApp("Points", {.id = "b.one", .extension = at("point.b")})});
+  ASSERT_TRUE(restart());
+  EXPECT_EQ(logCount("built 2 plug-in records"), 1u);
+  const Value pointA = Value::dictionary(at("point.a"));
+  EXPECT_EQ(matchIds(pointA), Ids{"a.one"});
+  add({inApp("Later", {.id = "a.two", .extension = at("point.a")})});
+  EXPECT_EQ(matchIds(pointA), (Ids{"a.one", "a.two"}));
+  EXPECT_EQ(matchIds(Value::dictionary(at("point.b"))), Ids{"b.one"});
+}
+
 TEST_F(DiscoveryTest, BadRulesAreRefusedAndProtocolVersionTwoGetsNoMatches) {
   add({inApp("One", {.id = "v2.plugin"})});
   EXPECT_EQ(matchOutcome(Value::string("QSExtensionIdentifier"), 0),
