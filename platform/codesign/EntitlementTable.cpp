@@ -1,22 +1,16 @@
 #include "platform/codesign/EntitlementTable.h"
 
-#include <fcntl.h>
-#include <sys/stat.h>
-#include <unistd.h>
-
-#include <algorithm>
 #include <cctype>
 #include <cerrno>
 #include <cstring>
-#include <filesystem>
 #include <string_view>
 #include <vector>
 
 #include "platform/codesign/DigestCache.h"
+#include "platform/codesign/TrustedDirectory.h"
 #include "platform/os/Format.h"
 #include "platform/os/Log.h"
 #include "platform/os/Paths.h"
-#include "platform/value/PropertyList.h"
 #include "platform/value/Value.h"
 
 namespace codesign {
@@ -24,15 +18,7 @@ namespace codesign {
 namespace {
 
 constexpr std::string_view kTableDir = "etc/annexa/entitlements.d";
-constexpr std::string_view kSuffix = ".plist";
-
-void skip(const std::string& path, std::string_view why) {
-  os::Log::write(5, os::format("entitlement table: ignoring %s: %s", {path, why}));
-}
-
-bool isTableFileName(const std::string& name) {
-  return name.size() > kSuffix.size() && name.front() != '.' && name.ends_with(kSuffix);
-}
+constexpr std::string_view kWhat = "entitlement table";
 
 // 64 hexadecimal digits in lower case, or nothing when |text| is not a SHA-256 digest.
 std::optional<std::string> normalizedDigest(const std::string& text) {
@@ -45,36 +31,6 @@ std::optional<std::string> normalizedDigest(const std::string& text) {
   return digest;
 }
 
-// Why a table file must not be trusted, or nothing when only root or the daemon's user can
-// have written it.
-std::optional<std::string> untrusted(const struct stat& st) {
-  if (!S_ISREG(st.st_mode)) return "not a regular file";
-  if (st.st_uid != 0 && st.st_uid != geteuid()) {
-    return os::format("owned by uid %u, neither root nor the daemon's user", {st.st_uid});
-  }
-  if (st.st_mode & (S_IWGRP | S_IWOTH)) return "writable by group or others";
-  return std::nullopt;
-}
-
-// The property list behind |fd|, when only root or the daemon's user can have written it. The
-// check and the read go through one descriptor, so they see the same file.
-os::Result<value::Value> readTrusted(int fd) {
-  struct stat st {};
-  if (fstat(fd, &st) != 0) return os::Error::fromErrno("fstat");
-  if (auto why = untrusted(st)) return os::Error{EPERM, *why};
-  std::vector<std::uint8_t> bytes;
-  std::uint8_t buffer[8192];
-  // Past kMaxBytes the reader refuses the file whole, so reading stops there.
-  while (bytes.size() <= value::PropertyList::kMaxBytes) {
-    ssize_t n = read(fd, buffer, sizeof buffer);
-    if (n < 0 && errno == EINTR) continue;
-    if (n < 0) return os::Error::fromErrno("read");
-    if (n == 0) break;
-    bytes.insert(bytes.end(), buffer, buffer + n);
-  }
-  return value::PropertyList::read(bytes);
-}
-
 // The executable as the kernel would name it; a path that does not resolve stays as written.
 std::string canonicalExecutable(const std::string& path) {
   auto resolved = os::Paths::canonical(path);
@@ -84,44 +40,11 @@ std::string canonicalExecutable(const std::string& path) {
 }  // namespace
 
 os::Result<EntitlementTable> EntitlementTable::load() {
-  std::string dir = os::Paths::underRoot(kTableDir);
-  std::error_code ec;
-  std::filesystem::directory_iterator it(dir, ec);
-  if (ec == std::errc::no_such_file_or_directory) return EntitlementTable();
-  std::vector<std::string> names;
-  for (; !ec && it != std::filesystem::directory_iterator(); it.increment(ec)) {
-    std::string name = it->path().filename().string();
-    if (isTableFileName(name)) names.push_back(std::move(name));
-  }
-  if (ec) return os::Error{ec.value(), "entitlement table " + dir + ": " + ec.message()};
-  std::sort(names.begin(), names.end());
+  auto entries = TrustedDirectory::parseEach<Entry>(kTableDir, kWhat, &EntitlementTable::entryFrom);
+  if (!entries.ok()) return entries.error();
   EntitlementTable table;
-  for (const std::string& name : names) {
-    if (auto entry = readFile(dir + "/" + name)) table.entries_.push_back(std::move(*entry));
-  }
+  table.entries_ = std::move(entries).value();
   return table;
-}
-
-std::optional<EntitlementTable::Entry> EntitlementTable::readFile(const std::string& path) {
-  // Non-blocking, so that a FIFO in the directory cannot stall the daemon; never through a
-  // symbolic link, which would let whoever may write its target grant entitlements.
-  int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOFOLLOW);
-  if (fd < 0) {
-    skip(path, std::strerror(errno));
-    return std::nullopt;
-  }
-  os::Result<value::Value> file = readTrusted(fd);
-  close(fd);
-  if (!file.ok()) {
-    skip(path, file.error().message);
-    return std::nullopt;
-  }
-  os::Result<Entry> entry = entryFrom(path, file.value());
-  if (!entry.ok()) {
-    skip(path, entry.error().message);
-    return std::nullopt;
-  }
-  return std::move(entry).value();
 }
 
 os::Result<EntitlementTable::Entry> EntitlementTable::entryFrom(const std::string& source,

@@ -9,12 +9,11 @@
 
 namespace codesign {
 
-// The entitlement table of a device root: every "<root>/etc/annexa/entitlements.d/*.plist"
-// (hidden files excluded, as the shell's glob does),
-// each a dictionary with "Executable" (absolute path), optionally "SHA256" (the hex digest the
-// executable must have) and "Entitlements" (a dictionary). A file that someone other than root
-// and the daemon's user could have written, and a malformed file, is skipped with a log line
-// naming it. Immutable once loaded; safe to read from several threads at once.
+// The entitlement table of a device root: every "<root>/etc/annexa/entitlements.d/*.plist" that
+// counts (TrustedDirectory), each a dictionary with "Executable" (absolute path), optionally
+// "SHA256" (the hex digest the executable must have) and "Entitlements" (a dictionary). A
+// malformed file is skipped with a log line naming it. Immutable once loaded; safe to read from
+// several threads at once.
 class EntitlementTable {
  public:
   // Reads the table of the current device root (os::Paths::root()), files in name order. A
@@ -47,8 +46,6 @@ class EntitlementTable {
   static os::Result<Entry> entryFrom(const std::string& source, const value::Value& file);
 
  private:
-  static std::optional<Entry> readFile(const std::string& path);
-
   std::vector<Entry> entries_;
 };
 
