@@ -83,6 +83,10 @@ std::shared_ptr<AXDPlugIn> AXDPlugIn::initWithRGData(
                     {url.path(), error->description()});
     return nullptr;
   }
+  const registrum::PlugInRecord::Fields::Signature& signature = rgData->signature();
+  if (!rgData->declaredEntitlements().empty() && !signature.distrust.empty()) {
+    os::Log::notice("plug-in at %@ has no entitlements: %@", {url.path(), signature.distrust});
+  }
   record->readFacts();
   if (record->hostEntitlementDemand() == std::string()) {
     os::Log::notice("plug-in at %@ demands a malformed host entitlement %@: no host may use it",

@@ -191,8 +191,15 @@ class AXDPlugIn : public AXPlugInCore {
   // The data container and its "tmp" are made (mode 0700) when missing, so HOME and TMPDIR are
   // usable from the plug-in's first instruction. An error of code 4 when the bundle has no
   // executable or its container cannot be made (nothing registered), or the launcher refuses
-  // (logged with its error number).
+  // (logged with its error number). A plug-in whose signed bundle names its executable is refused
+  // with code 11 when the executable is no longer the file signed (checkExecutable), and the
+  // launcher is told the signed digest, so that it starts only that file.
   std::optional<AXError> enableForPid(pid_t pid) const;
+  // An error of code 11 (logged) when the file at |path| is not the executable the bundle's
+  // signature names, whose SHA-256 is |signedDigest|: swapped since the bundle was registered.
+  // Nothing when it is.
+  std::optional<AXError> checkExecutable(const std::string& path,
+                                         const std::string& signedDigest) const;
   // The busy answer, {"ExtensionBundleIdentifier": <bundle identifier, else the plug-in
   // identifier>}, when a process of the plug-in's bundle runs; nothing when none does.
   std::optional<value::Dictionary> checkBusy() const;

@@ -1,11 +1,15 @@
 // Enabling a plug-in for a host process: its service description and the launcher, and the
 // busy check of its running instances.
 
+#include <fcntl.h>
+#include <unistd.h>
+
 #include <cstdlib>
 
 #include "Annexa/AXBundle.h"
 #include "axd/AXDNames.h"
 #include "axd/AXDPlugIn.h"
+#include "platform/codesign/DigestCache.h"
 #include "platform/launcher/BusyInstances.h"
 #include "platform/launcher/ServiceLauncher.h"
 #include "platform/os/Format.h"
@@ -15,6 +19,7 @@
 namespace {
 
 constexpr std::int64_t kEnableFailed = 4;
+constexpr std::int64_t kNotSigned = 11;
 
 bool isTrue(const std::optional<value::Value>& v) {
   if (!v) return false;
@@ -50,7 +55,28 @@ std::optional<os::Error> prepareContainer(const std::string& container) {
   return std::nullopt;
 }
 
+// The error of code 11 for an executable at |path| that is not the file its bundle's signature
+// names (logged); nothing when it is.
+std::optional<AXError> checkExecutableDigest(const std::string& path,
+                                             const std::string& signedDigest,
+                                             const std::string& id) {
+  int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
+  os::Result<std::string> digest = fd >= 0 ? codesign::DigestCache::shared().sha256(fd, path)
+                                           : os::Result<std::string>(os::Error::fromErrno(path));
+  if (fd >= 0) close(fd);
+  if (digest.ok() && digest.value() == signedDigest) return std::nullopt;
+  os::Log::notice("refusing plug-in %@: its executable %@ is not the one its bundle signed (%@)",
+                  {id, path, digest.ok() ? "changed" : digest.error().message});
+  return AXMakeErrorWithFormat(kNotSigned,
+                               "the executable of plug-in %@ does not match its signature", {id});
+}
+
 }  // namespace
+
+std::optional<AXError> AXDPlugIn::checkExecutable(const std::string& path,
+                                                  const std::string& signedDigest) const {
+  return checkExecutableDigest(path, signedDigest, facts_.identifierText());
+}
 
 std::string AXDPlugIn::sandboxProfile() const {
   std::optional<value::Value> point = pluginKey("QSExtensionPointIdentifier");
@@ -111,6 +137,15 @@ std::optional<AXError> AXDPlugIn::enableForPid(pid_t pid) const {
   if (!executable) {
     return AXMakeErrorWithFormat(kEnableFailed, "cannot obtain executable path for plug-in %@(%@)",
                                  {id, uuidText});
+  }
+  if (const auto& signedDigest = rgproxy_->signature().executableDigest) {
+    if (std::optional<AXError> swapped = checkExecutable(*executable, *signedDigest)) {
+      return swapped;
+    }
+    // The launcher starts the file only while it still has this digest.
+    service = service.with(launcher::ServiceLauncher::kExecutableDigestKey,
+                           value::Value::string(*signedDigest));
+    description = description.with("ZynService", value::Value::dictionary(service));
   }
   os::Status added = launcher::ServiceLauncher::addService(
       pid, identifier().value_or(""), this->version().value_or(""), *executable, description);

@@ -40,7 +40,8 @@ std::string canonicalExecutable(const std::string& path) {
 }  // namespace
 
 os::Result<EntitlementTable> EntitlementTable::load() {
-  auto entries = TrustedDirectory::parseEach<Entry>(kTableDir, kWhat, &EntitlementTable::entryFrom);
+  auto entries = TrustedDirectory::parseEach<Entry>(os::Paths::underRoot(kTableDir), kWhat,
+                                                    &EntitlementTable::entryFrom);
   if (!entries.ok()) return entries.error();
   EntitlementTable table;
   table.entries_ = std::move(entries).value();

@@ -5,6 +5,7 @@
 
 #include <cerrno>
 
+#include "platform/codesign/ApplicationSignature.h"
 #include "platform/codesign/EntitlementTable.h"
 #include "platform/os/Process.h"
 
@@ -48,6 +49,12 @@ std::unique_ptr<Task> Task::fromAuditToken(pid_t pid, int pidfd) {
     entitlements = table.value().lookup(path.value(), imageFd).value_or(value::Dictionary());
   } else {
     tableError = table.error();
+  }
+  // The table's entries win over the bundle's: the device's own settings decide last.
+  if (auto granted = ApplicationSignature::entitlementsFor(path.value(), imageFd)) {
+    for (const auto& [key, entry] : *granted) {
+      if (!entitlements.find(key)) entitlements = entitlements.with(key, entry);
+    }
   }
   if (imageFd >= 0) close(imageFd);
   return std::unique_ptr<Task>(

@@ -15,9 +15,10 @@
 namespace codesign {
 
 // The code-signing identity of one process: its executable and the entitlements the device
-// root's entitlement table grants that executable. The table is read once, when the task is
-// made, so a changed table takes effect for the next connection. Immutable; safe to read from
-// several threads at once.
+// root's entitlement table grants that executable, with those of the signed application bundle
+// it lies in (ApplicationSignature) where the table says nothing of the same key. The table is read
+// once, when the task is made, so a changed table takes effect for the next connection. Immutable;
+// safe to read from several threads at once.
 class Task {
  public:
   // The task of process |pid|, checked against |pidfd| (its audit token) so a reused pid is

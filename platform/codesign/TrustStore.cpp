@@ -4,12 +4,14 @@
 
 #include "platform/codesign/SigningKey.h"
 #include "platform/codesign/TrustedDirectory.h"
+#include "platform/os/Paths.h"
 
 namespace codesign {
 
 namespace {
 
 constexpr const char* kWhat = "trust store";
+constexpr const char* kDirectory = "etc/annexa/trust.d";
 
 bool vouches(const TrustStore::Key& key, const std::string& identifier) {
   if (!key.prefixes) return true;
@@ -27,12 +29,17 @@ std::string listed(const std::vector<std::string>& prefixes) {
 
 }  // namespace
 
-os::Result<TrustStore> TrustStore::load() {
-  auto keys = TrustedDirectory::parseEach<Key>(kDirectory, kWhat, &TrustStore::keyFrom);
+os::Result<TrustStore> TrustStore::load(const std::string& root) {
+  auto keys = TrustedDirectory::parseEach<Key>(directory(root), kWhat, &TrustStore::keyFrom);
   if (!keys.ok()) return keys.error();
   TrustStore store;
   store.keys_ = std::move(keys).value();
   return store;
+}
+
+std::string TrustStore::directory(const std::string& root) {
+  if (root.empty()) return os::Paths::underRoot(kDirectory);
+  return (root == "/" ? std::string() : root) + "/" + kDirectory;
 }
 
 os::Result<TrustStore::Key> TrustStore::keyFrom(const std::string& source,

@@ -18,18 +18,18 @@ namespace codesign {
 // loaded; safe to read from several threads at once.
 class TrustStore {
  public:
-  static constexpr const char* kDirectory = "etc/annexa/trust.d";
-
   struct Key {
     std::string source;  // the file, for log lines
     std::string keyId;   // SigningKey::keyIdOf its public key
     std::optional<std::vector<std::string>> prefixes;
   };
 
-  // The trust store of the current device root, files in name order. A missing directory trusts
-  // no key. Fails with the system's error number only when the directory exists and cannot be
-  // listed.
-  static os::Result<TrustStore> load();
+  // The trust store of the device root |root| (the current one when empty), files in name
+  // order. A missing directory trusts no key. Fails with the system's error number only when the
+  // directory exists and cannot be listed.
+  static os::Result<TrustStore> load(const std::string& root = "");
+  // "<root>/etc/annexa/trust.d" (the current root when |root| is empty).
+  static std::string directory(const std::string& root = "");
   // The key that the trust file |source| holding |file| describes. Fails with EINVAL, saying
   // why, when |file| is not of the shape above.
   static os::Result<Key> keyFrom(const std::string& source, const value::Value& file);

@@ -12,7 +12,6 @@
 
 #include "platform/os/Format.h"
 #include "platform/os/Log.h"
-#include "platform/os/Paths.h"
 #include "platform/value/PropertyList.h"
 
 namespace codesign {
@@ -68,7 +67,7 @@ os::Result<value::Value> readFile(const std::string& path) {
 
 os::Result<std::vector<TrustedDirectory::File>> TrustedDirectory::load(std::string_view directory,
                                                                        std::string_view what) {
-  std::string dir = os::Paths::underRoot(directory);
+  std::string dir(directory);
   std::error_code ec;
   std::filesystem::directory_iterator it(dir, ec);
   if (ec == std::errc::no_such_file_or_directory) return std::vector<File>();

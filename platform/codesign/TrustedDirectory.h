@@ -9,8 +9,8 @@
 
 namespace codesign {
 
-// The property-list files of a configuration directory under the device root that decide who
-// may do what (the entitlement table, the trusted signing keys): "<root>/<directory>/*.plist",
+// The property-list files of a configuration directory that decide who may do what (the
+// entitlement table, the trusted signing keys): "<directory>/*.plist",
 // hidden files excluded, in name order. Only a regular file that root or the daemon's user owns
 // and that neither group nor others may write counts, opened without following a link and
 // without blocking (a FIFO cannot stall the reader); any other file, and one that is no property
@@ -22,7 +22,8 @@ class TrustedDirectory {
     value::Value contents;
   };
 
-  // The files that count, with their contents. A missing directory has none. Fails with the
+  // The files of |directory| (a path) that count, with their contents. A missing directory has
+  // none. Fails with the
   // system's error number only when the directory exists and cannot be listed.
   static os::Result<std::vector<File>> load(std::string_view directory, std::string_view what);
 

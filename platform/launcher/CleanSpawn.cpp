@@ -32,8 +32,8 @@ os::Error spawnError(int errnum, const std::string& what) {
 }
 
 // Signal dispositions and the mask are inherited across exec, descriptors without
-// close-on-exec too; the child gets none of ours.
-int configure(Attributes& attributes, FileActions& actions) {
+// close-on-exec too; the child gets none of ours but |executableFd|, as kExecutableDescriptor.
+int configure(Attributes& attributes, FileActions& actions, int executableFd) {
   sigset_t none, all;
   sigemptyset(&none);
   sigfillset(&all);
@@ -44,17 +44,25 @@ int configure(Attributes& attributes, FileActions& actions) {
     failed =
         posix_spawnattr_setflags(&attributes.value, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF);
   }
-  if (failed == 0) failed = posix_spawn_file_actions_addclosefrom_np(&actions.value, 3);
+  if (failed != 0) return failed;
+  if (executableFd < 0) return posix_spawn_file_actions_addclosefrom_np(&actions.value, 3);
+  // The copy dup2 makes has no close-on-exec; everything above it is closed.
+  failed = posix_spawn_file_actions_adddup2(&actions.value, executableFd,
+                                            CleanSpawn::kExecutableDescriptor);
+  if (failed == 0) {
+    failed = posix_spawn_file_actions_addclosefrom_np(&actions.value,
+                                                      CleanSpawn::kExecutableDescriptor + 1);
+  }
   return failed;
 }
 
-}  // namespace
-
-os::Result<pid_t> CleanSpawn::run(const std::string& program,
-                                  const std::vector<std::string>& environment) {
+os::Result<pid_t> spawn(const std::string& program, const std::string& path, int executableFd,
+                        const std::vector<std::string>& environment) {
   Attributes attributes;
   FileActions actions;
-  if (int failed = configure(attributes, actions)) return spawnError(failed, "spawn settings");
+  if (int failed = configure(attributes, actions, executableFd)) {
+    return spawnError(failed, "spawn settings");
+  }
   std::vector<char*> envp;
   for (const std::string& entry : environment) envp.push_back(const_cast<char*>(entry.c_str()));
   envp.push_back(nullptr);
@@ -62,9 +70,22 @@ os::Result<pid_t> CleanSpawn::run(const std::string& program,
   char* argv[] = {argv0.data(), nullptr};
   pid_t child = 0;
   int failed =
-      posix_spawn(&child, program.c_str(), &actions.value, &attributes.value, argv, envp.data());
+      posix_spawn(&child, path.c_str(), &actions.value, &attributes.value, argv, envp.data());
   if (failed != 0) return spawnError(failed, "spawning " + program);
   return child;
+}
+
+}  // namespace
+
+os::Result<pid_t> CleanSpawn::run(const std::string& program,
+                                  const std::vector<std::string>& environment) {
+  return spawn(program, program, -1, environment);
+}
+
+os::Result<pid_t> CleanSpawn::runOpened(const std::string& program, int executableFd,
+                                        const std::vector<std::string>& environment) {
+  return spawn(program, "/proc/self/fd/" + std::to_string(kExecutableDescriptor), executableFd,
+               environment);
 }
 
 }  // namespace launcher

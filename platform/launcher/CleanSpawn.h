@@ -21,6 +21,15 @@ class CleanSpawn {
   // (ENOENT, EACCES, ENOEXEC...).
   static os::Result<pid_t> run(const std::string& program,
                                const std::vector<std::string>& environment);
+  // The same, but the program run is the file open on |executableFd| (the caller keeps it; it
+  // must lie above kExecutableDescriptor), not whatever lies at |program| by then: the child gets
+  // it as descriptor kExecutableDescriptor and executes "/proc/self/fd/<that>", so a file
+  // checked through |executableFd| is the file that runs, script or not. The descriptor stays
+  // open in the program, read-only.
+  static os::Result<pid_t> runOpened(const std::string& program, int executableFd,
+                                     const std::vector<std::string>& environment);
+
+  static constexpr int kExecutableDescriptor = 3;
 };
 
 }  // namespace launcher

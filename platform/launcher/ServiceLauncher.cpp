@@ -12,6 +12,7 @@
 #include <optional>
 #include <tuple>
 
+#include "platform/codesign/DigestCache.h"
 #include "platform/launcher/CleanSpawn.h"
 #include "platform/launcher/ServiceFile.h"
 #include "platform/launcher/ServiceName.h"
@@ -217,6 +218,16 @@ std::vector<std::string> environmentOf(const value::Dictionary& description) {
   return environment;
 }
 
+// The SHA-256 the description's "ZynService" says the executable must have, when it says one.
+std::optional<std::string> signedDigest(const value::Dictionary& description) {
+  const value::Value* service = description.find("ZynService");
+  const value::Dictionary* entries = service ? service->asDictionary() : nullptr;
+  const value::Value* digest =
+      entries ? entries->find(ServiceLauncher::kExecutableDigestKey) : nullptr;
+  if (!digest || !digest->asString()) return std::nullopt;
+  return *digest->asString();
+}
+
 }  // namespace
 
 os::Status ServiceLauncher::addService(pid_t host, const std::string& bundleIdentifier,
@@ -249,8 +260,32 @@ os::Result<pid_t> ServiceLauncher::start(const std::string& bundleIdentifier,
   if (!valid.ok()) return valid.error();
   os::Result<ServiceFile::Contents> service = readOwnService(bundleIdentifier, version);
   if (!service.ok()) return service.error();
-  return CleanSpawn::run(service.value().executablePath,
-                         environmentOf(service.value().description));
+  const std::string& executable = service.value().executablePath;
+  std::vector<std::string> environment = environmentOf(service.value().description);
+  std::optional<std::string> digest = signedDigest(service.value().description);
+  if (!digest) return CleanSpawn::run(executable, environment);
+  return startChecked(executable, *digest, environment);
+}
+
+os::Result<pid_t> ServiceLauncher::startChecked(const std::string& executable,
+                                                const std::string& digest,
+                                                const std::vector<std::string>& environment) {
+  int opened = open(executable.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
+  if (opened < 0) return os::Error::fromErrno("launcher: " + executable);
+  // Above the descriptor the child gets it as, which dup2 would leave marked close-on-exec.
+  int fd = fcntl(opened, F_DUPFD_CLOEXEC, CleanSpawn::kExecutableDescriptor + 1);
+  close(opened);
+  if (fd < 0) return os::Error::fromErrno("launcher: " + executable);
+  os::Result<std::string> actual = codesign::DigestCache::shared().sha256(fd, executable);
+  os::Result<pid_t> child =
+      os::Error{EPERM, "launcher: " + executable + " is not the executable its bundle signed"};
+  if (actual.ok() && actual.value() == digest) {
+    child = CleanSpawn::runOpened(executable, fd, environment);
+  } else {
+    os::Log::write(kLogError, child.error().message);
+  }
+  close(fd);
+  return child;
 }
 
 int ServiceLauncher::removeService(const std::string& bundleIdentifier,

@@ -22,8 +22,8 @@ namespace launcher {
 // same device root sees the same services.
 //
 // A description is a dictionary whose "ZynService" dictionary may hold "EnvironmentVariables"
-// (the plug-in's whole environment) and "_SandboxProfile" (the name of its sandbox profile,
-// recorded here but not yet applied at start).
+// (the plug-in's whole environment), "_SandboxProfile" (the name of its sandbox profile,
+// recorded here but not yet applied at start) and, for a signed bundle, kExecutableDigestKey.
 //
 // Stateless; safe to call from any thread and any number of processes at once. Additions,
 // listings and starts hold the table lock shared, removals exclusive (TableLock): an addition and
@@ -63,7 +63,13 @@ class ServiceLauncher {
   // record for an earlier process that had this pid does not count),
   // EINVAL for an empty identifier or version or a broken record, or the errno of reading the
   // record or of posix_spawn (ENOENT when the executable has gone since).
+  // When the description's "ZynService" holds kExecutableDigestKey, the executable is opened
+  // once, checked to have that SHA-256 and run from that descriptor (CleanSpawn::runOpened); one
+  // with another digest is not started (EPERM, logged).
   static os::Result<pid_t> start(const std::string& bundleIdentifier, const std::string& version);
+
+  // The key under "ZynService" of the SHA-256 (hex) that the executable must have to be started.
+  static constexpr const char* kExecutableDigestKey = "_ExecutableSHA256";
 
   // Deletes the service of |bundleIdentifier| and |version| for every host. 0 when at least one
   // was removed, kNoSuchService when none existed, EINVAL for an empty identifier or version,
@@ -80,6 +86,12 @@ class ServiceLauncher {
   // recorded. Files and directories that do not read as a service are skipped with a log line.
   // Fails with the errno of taking the table lock or reading the table directory.
   static os::Result<std::vector<Service>> services();
+
+ private:
+  // Starts |executable| only when it has the SHA-256 |digest|, from the descriptor it was
+  // checked through.
+  static os::Result<pid_t> startChecked(const std::string& executable, const std::string& digest,
+                                        const std::vector<std::string>& environment);
 };
 
 }  // namespace launcher

@@ -31,10 +31,10 @@ void drain(int fd) {
 
 }  // namespace
 
-os::Result<std::unique_ptr<ChangeWatcher>> ChangeWatcher::start(
-    const std::string& databasePath, const std::string& notifyFile,
-    std::shared_ptr<sdk::SdkCache> sdks) {
-  os::Result<std::unique_ptr<Store>> store = Store::open(databasePath, std::move(sdks));
+os::Result<std::unique_ptr<ChangeWatcher>> ChangeWatcher::start(const std::string& databasePath,
+                                                                const std::string& notifyFile,
+                                                                std::shared_ptr<Sources> sources) {
+  os::Result<std::unique_ptr<Store>> store = Store::open(databasePath, std::move(sources));
   if (!store.ok()) return store.error();
   int wakeFd = eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
   if (wakeFd < 0) return os::Error::fromErrno("eventfd");

@@ -24,12 +24,12 @@ class ChangeWatcher {
   static constexpr int kSafetyPollMs = 2000;
   static constexpr int kBatch = 64;
 
-  // Starts the thread with its own connection to |databasePath| (sharing the workspace's |sdks|),
-  // watching the directory of |notifyFile|. Fails when the database cannot be opened or the
-  // thread's descriptors made.
+  // Starts the thread with its own connection to |databasePath| (sharing the workspace's
+  // |sources|), watching the directory of |notifyFile|. Fails when the database cannot be opened or
+  // the thread's descriptors made.
   static os::Result<std::unique_ptr<ChangeWatcher>> start(const std::string& databasePath,
                                                           const std::string& notifyFile,
-                                                          std::shared_ptr<sdk::SdkCache> sdks);
+                                                          std::shared_ptr<Sources> sources);
 
   // Tells every watcher of |notifyFile|'s database, in any process, that a change was
   // committed. Failures are logged: the safety poll still finds the change.

@@ -6,6 +6,8 @@
 #include <string>
 #include <string_view>
 
+#include "platform/codesign/BundleSignature.h"
+#include "platform/codesign/TrustStore.h"
 #include "platform/registrum/ApplicationRecord.h"
 #include "platform/value/Value.h"
 
@@ -37,7 +39,24 @@ class PlugInRecord {
     // The extension point queries pre-select on, as stored with the row; nothing in a record
     // built by hand.
     std::optional<std::string> rulePoint;
+    // The entitlements the registry honours: those the bundle declares when its signature is
+    // trusted for its identifier, none otherwise (see signature).
     value::Dictionary entitlements;
+    // What the bundle's Entitlements.plist declares, honoured or not.
+    value::Dictionary declaredEntitlements;
+    // The bundle's signature as verified when it was registered, and the trust store's
+    // judgement of it when the record was read.
+    struct Signature {
+      codesign::BundleSignature::State state = codesign::BundleSignature::State::Unsigned;
+      std::string signer;  // signed: the key id
+      std::string note;    // tampered: what failed
+      // Signed: the signed SHA-256 of the file "QFBundleExecutable" names; nothing when the
+      // bundle names none or is not signed.
+      std::optional<std::string> executableDigest;
+      codesign::TrustStore::Outcome outcome = codesign::TrustStore::Outcome::Unsigned;
+      std::string distrust;  // why the entitlements are not honoured; empty when they are
+    };
+    Signature signature;
     double registrationDate = 0;
     bool onSystemPartition = false;
     std::optional<std::string> dataContainerPath;
@@ -84,8 +103,12 @@ class PlugInRecord {
   const std::optional<std::string>& extensionPointIdentifier() const {
     return fields_.extensionPointIdentifier;
   }
-  // The dictionary of the bundle's Entitlements.plist; empty when the bundle has none.
+  // The entitlements honoured: the dictionary of the bundle's Entitlements.plist when its
+  // signature is trusted for the plug-in's identifier (signature()), else empty.
   const value::Dictionary& entitlements() const { return fields_.entitlements; }
+  // The bundle's Entitlements.plist as declared; empty when the bundle has none.
+  const value::Dictionary& declaredEntitlements() const { return fields_.declaredEntitlements; }
+  const Fields::Signature& signature() const { return fields_.signature; }
   // When the bundle was last registered, in seconds since 1970-01-01 00:00 UTC.
   double registrationDate() const { return fields_.registrationDate; }
   // True when the bundle lies on the system volume, under "<root>/System/".

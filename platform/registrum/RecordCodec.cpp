@@ -84,6 +84,7 @@ Value RecordCodec::encodeRecord(const PlugInRecord& record) {
     out["application"] = encodeApplication(*fields.containingApplication);
   }
   out["entitlements"] = Value::dictionary(fields.entitlements);
+  out["declaredEntitlements"] = Value::dictionary(fields.declaredEntitlements);
   out["registrationDate"] = Value::real(fields.registrationDate);
   out["onSystemPartition"] = Value::boolean(fields.onSystemPartition);
   putString(out, "dataContainer", fields.dataContainerPath);
@@ -98,6 +99,7 @@ std::shared_ptr<const PlugInRecord> RecordCodec::decodeRecord(const value::Dicti
   fields.bundlePath = getString(in, "path");
   fields.containingApplication = decodeApplication(in.find("application"));
   fields.entitlements = getDictionary(in, "entitlements");
+  fields.declaredEntitlements = getDictionary(in, "declaredEntitlements");
   const Value* date = in.find("registrationDate");
   fields.registrationDate = date ? date->asReal().value_or(0) : 0;
   fields.onSystemPartition = getBool(in, "onSystemPartition");

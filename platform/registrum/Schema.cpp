@@ -26,7 +26,11 @@ CREATE TABLE IF NOT EXISTS plugins (
   on_system_partition INTEGER NOT NULL,
   data_container TEXT,
   entitlements BLOB NOT NULL,
-  info BLOB NOT NULL
+  info BLOB NOT NULL,
+  signature TEXT NOT NULL DEFAULT 'unsigned',
+  signer TEXT,
+  signature_note TEXT,
+  executable_digest TEXT
 );
 CREATE INDEX IF NOT EXISTS plugins_by_identifier ON plugins(plugin_identifier);
 CREATE INDEX IF NOT EXISTS plugins_by_rule_point ON plugins(rule_point);
@@ -43,6 +47,12 @@ constexpr const char* kMigrations[] = {
     // The plug-in dictionary is resolved against the SDKs at every read, so that an SDK added,
     // changed or removed later counts; the copy resolved at registration goes.
     "ALTER TABLE plugins DROP COLUMN plugin_dictionary",
+    // What verifying the bundle's signature found when it was registered; a row of version 2
+    // was never verified, so it counts as unsigned until the bundle is registered again.
+    "ALTER TABLE plugins ADD COLUMN signature TEXT NOT NULL DEFAULT 'unsigned';"
+    "ALTER TABLE plugins ADD COLUMN signer TEXT;"
+    "ALTER TABLE plugins ADD COLUMN signature_note TEXT;"
+    "ALTER TABLE plugins ADD COLUMN executable_digest TEXT",
 };
 static_assert(std::size(kMigrations) == Schema::kVersion - 1);
 

@@ -10,7 +10,7 @@ namespace registrum {
 class Schema {
  public:
   // 2: plug-in rows keep no resolved plug-in dictionary.
-  static constexpr int kVersion = 2;
+  static constexpr int kVersion = 3;
   // The change log keeps this many newest entries; older ones are trimmed at each change.
   static constexpr int kChangesKept = 1000;
 

@@ -18,11 +18,13 @@ namespace {
 // Plug-in columns 0-6, then the application's columns 7-11 (all NULL without one).
 constexpr const char* kPlugInSelect =
     "SELECT p.uuid, p.path, p.registration_date, p.on_system_partition, p.data_container, "
-    "p.entitlements, p.info, p.rule_point, "
+    "p.entitlements, p.info, p.rule_point, p.signature, p.signer, p.signature_note, "
+    "p.executable_digest, "
     "a.path, a.bundle_identifier, a.bundle_version, a.localized_name, a.placeholder "
     "FROM plugins p LEFT JOIN applications a ON a.path = p.application_path ";
 constexpr int kRulePointColumn = 7;
-constexpr int kApplicationColumn = 8;
+constexpr int kSignatureColumn = 8;
+constexpr int kApplicationColumn = 12;
 
 constexpr const char* kKeySelect = "SELECT uuid, path, data_container FROM plugins ";
 
@@ -68,6 +70,11 @@ os::Status setAside(const std::string& path, const struct stat& seen,
   return os::success();
 }
 
+// |text|, or nothing (SQL NULL) when it is empty.
+std::optional<std::string> optionalText(const std::string& text) {
+  return text.empty() ? std::nullopt : std::optional(text);
+}
+
 os::Error corrupt(const std::string& what, const os::Error& cause) {
   return os::Error{EIO, "registry database: " + what + ": " + cause.message};
 }
@@ -75,7 +82,7 @@ os::Error corrupt(const std::string& what, const os::Error& cause) {
 }  // namespace
 
 os::Result<std::unique_ptr<Store>> Store::open(const std::string& path,
-                                               std::shared_ptr<sdk::SdkCache> sdks,
+                                               std::shared_ptr<Sources> sources,
                                                const std::vector<std::string>& keptWith) {
   struct stat seen {};
   bool existed = ::stat(path.c_str(), &seen) == 0;
@@ -87,7 +94,7 @@ os::Result<std::unique_ptr<Store>> Store::open(const std::string& path,
     db = openWithSchema(path);
   }
   if (!db.ok()) return db.error();
-  return std::unique_ptr<Store>(new Store(std::move(db.value()), std::move(sdks)));
+  return std::unique_ptr<Store>(new Store(std::move(db.value()), std::move(sources)));
 }
 
 os::Result<std::shared_ptr<const ApplicationRecord>> Store::application(const std::string& path) {
@@ -131,7 +138,7 @@ os::Result<std::vector<std::shared_ptr<const ApplicationRecord>>> Store::applica
 os::Result<PlugInList> Store::plugIns(const Selection& selection) {
   os::Result<Database::Version> version = db_->version();
   if (!version.ok()) return version.error();
-  std::uint64_t sdkGeneration = sdks_->refresh();
+  std::uint64_t sdkGeneration = sources_->refresh();
   if (version.value() != snapshot_.version || sdkGeneration != snapshot_.sdkGeneration ||
       snapshot_.lists.size() >= kMaxSnapshotLists) {
     snapshot_ = Snapshot{version.value(), sdkGeneration, {}};
@@ -194,8 +201,9 @@ os::Status Store::putApplication(const ApplicationRecord::Fields& fields) {
 os::Status Store::putPlugIn(const PlugInRecord::Fields& fields) {
   os::Result<Statement> upsert = db_->prepare(
       "INSERT OR REPLACE INTO plugins (uuid, path, application_path, plugin_identifier, "
-      "rule_point, registration_date, on_system_partition, data_container, entitlements, info) "
-      "VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?)");
+      "rule_point, registration_date, on_system_partition, data_container, entitlements, info, "
+      "signature, signer, signature_note, executable_digest) "
+      "VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?)");
   if (!upsert.ok()) return upsert.error();
   std::optional<std::string> application;
   if (fields.containingApplication) application = fields.containingApplication->path();
@@ -208,15 +216,19 @@ os::Status Store::putPlugIn(const PlugInRecord::Fields& fields) {
       .bind(6, fields.registrationDate)
       .bind(7, std::int64_t{fields.onSystemPartition})
       .bind(8, fields.dataContainerPath)
-      .bind(9, RecordCodec::encodeDictionary(fields.entitlements))
+      .bind(9, RecordCodec::encodeDictionary(fields.declaredEntitlements))
       .bind(10, RecordCodec::encodeDictionary(fields.infoDictionary))
+      .bind(11, std::string(codesign::BundleSignature::stateName(fields.signature.state)))
+      .bind(12, optionalText(fields.signature.signer))
+      .bind(13, optionalText(fields.signature.note))
+      .bind(14, fields.signature.executableDigest)
       .run();
 }
 
 os::Result<std::vector<Store::PlugInKey>> Store::damagedPlugIns() {
   os::Result<Statement> select = db_->prepare(std::string(kPlugInSelect) + "ORDER BY p.path");
   if (!select.ok()) return select.error();
-  std::uint64_t sdkGeneration = sdks_->refresh();
+  std::uint64_t sdkGeneration = sources_->refresh();
   std::vector<PlugInKey> damaged;
   for (;;) {
     os::Result<bool> row = select.value().step();
@@ -312,7 +324,7 @@ os::Result<std::shared_ptr<const PlugInRecord>> Store::onePlugIn(const std::stri
       db_->prepare(std::string(kPlugInSelect) + "WHERE " + where + " = ?");
   if (!select.ok()) return select.error();
   select.value().bind(1, key);
-  std::uint64_t sdkGeneration = sdks_->refresh();
+  std::uint64_t sdkGeneration = sources_->refresh();
   os::Result<bool> row = select.value().step();
   if (!row.ok()) return row.error();
   if (!row.value()) return std::shared_ptr<const PlugInRecord>();
@@ -323,7 +335,7 @@ os::Result<std::shared_ptr<const PlugInRecord>> Store::onePlugIn(const std::stri
 }
 
 os::Result<PlugInList> Store::plugInRows(Statement& statement) {
-  std::uint64_t sdkGeneration = sdks_->refresh();
+  std::uint64_t sdkGeneration = sources_->refresh();
   PlugInList plugIns;
   std::shared_ptr<const ApplicationRecord> application;
   for (;;) {
@@ -375,13 +387,13 @@ os::Result<std::shared_ptr<const PlugInRecord>> Store::plugInRow(
   fields.registrationDate = row.real(2);
   fields.onSystemPartition = row.integer(3) != 0;
   fields.dataContainerPath = row.optionalText(4);
-  value::Dictionary* blobs[] = {&fields.entitlements, &fields.infoDictionary};
+  value::Dictionary* blobs[] = {&fields.declaredEntitlements, &fields.infoDictionary};
   for (int i = 0; i < 2; ++i) {
     os::Result<value::Dictionary> decoded = RecordCodec::decodeDictionary(row.blob(5 + i));
     if (!decoded.ok()) return corrupt("plug-in " + uuid, decoded.error());
     *blobs[i] = decoded.value();
   }
-  value::Dictionary resolved = sdks_->resolve(fields.infoDictionary);
+  value::Dictionary resolved = sources_->sdks().resolve(fields.infoDictionary);
   const value::Value* plugIn = resolved.find("QSExtension");
   if (!plugIn || !plugIn->asDictionary()) {
     return os::Error{EIO, "registry database: plug-in " + uuid + " has no \"QSExtension\""};
@@ -399,7 +411,35 @@ os::Result<std::shared_ptr<const PlugInRecord>> Store::plugInRow(
     }
   }
   RecordFields::derive(fields);
+  judge(row, fields);
   return std::make_shared<const PlugInRecord>(std::move(fields));
+}
+
+void Store::judge(const Statement& row, PlugInRecord::Fields& fields) {
+  PlugInRecord::Fields::Signature& signature = fields.signature;
+  codesign::BundleSignature::Verification verification;
+  std::string state = row.text(kSignatureColumn);
+  if (state == codesign::BundleSignature::stateName(codesign::BundleSignature::State::Signed)) {
+    verification.state = codesign::BundleSignature::State::Signed;
+  } else if (state !=
+             codesign::BundleSignature::stateName(codesign::BundleSignature::State::Unsigned)) {
+    // A state this program does not know counts as what fails closed.
+    verification.state = codesign::BundleSignature::State::Tampered;
+  }
+  verification.signer = row.optionalText(kSignatureColumn + 1).value_or("");
+  verification.reason = row.optionalText(kSignatureColumn + 2).value_or("");
+  signature.state = verification.state;
+  signature.signer = verification.signer;
+  signature.note = verification.reason;
+  signature.executableDigest = row.optionalText(kSignatureColumn + 3);
+  codesign::TrustStore::Judgement judged =
+      sources_->trust().store()->judge(verification, fields.plugInIdentifier.value_or(""));
+  signature.outcome = judged.outcome;
+  if (judged.outcome == codesign::TrustStore::Outcome::Trusted) {
+    fields.entitlements = fields.declaredEntitlements;
+  } else {
+    signature.distrust = judged.reason;
+  }
 }
 
 std::shared_ptr<const ApplicationRecord> Store::applicationRow(const Statement& row, int first) {

@@ -12,16 +12,16 @@
 #include "platform/os/Error.h"
 #include "platform/registrum/Database.h"
 #include "platform/registrum/Observer.h"
-#include "platform/sdk/SdkCache.h"
+#include "platform/registrum/Sources.h"
 
 namespace registrum {
 
 // The registry's rows over one database connection: reads and writes of applications, plug-ins
 // and the change log. A plug-in row holds the bundle's own Info.plist; each read resolves its
-// plug-in dictionary against the SDKs as they are then (one SdkCache::refresh() per read, so no
-// system call per row). Not thread-safe: its owner serialises every call (Workspace's mutex, or
-// the notice thread that owns its own Store). Writes that belong together run inside
-// database().transaction().
+// plug-in dictionary against the SDKs, and judges its entitlements by the trusted keys, as they are
+// then (one Sources::refresh() per read, so no system call per row). Not thread-safe: its owner
+// serialises every call (Workspace's mutex, or the notice thread that owns its own Store). Writes
+// that belong together run inside database().transaction().
 class Store {
  public:
   enum class ChangeKind : std::int64_t { Install = 1, Uninstall = 2 };
@@ -49,12 +49,12 @@ class Store {
   };
 
   // Opens the database file at |path| and makes sure its schema is in place. Plug-in rows are
-  // resolved against |sdks|, which the store shares. A file that is no database, holds another
+  // resolved against |sources|, which the store shares. A file that is no database, holds another
   // program's tables or has a later schema version is renamed to "<path>.damaged-<seconds>",
   // with its -wal and -shm and the paths |keptWith| (what belongs to its records), logged, and
   // replaced by an empty database.
   static os::Result<std::unique_ptr<Store>> open(const std::string& path,
-                                                 std::shared_ptr<sdk::SdkCache> sdks,
+                                                 std::shared_ptr<Sources> sources,
                                                  const std::vector<std::string>& keptWith = {});
 
   Database& database() { return *db_; }
@@ -98,8 +98,8 @@ class Store {
   os::Result<std::vector<Change>> changesAfter(std::int64_t sequence, int limit);
 
  private:
-  Store(std::unique_ptr<Database> db, std::shared_ptr<sdk::SdkCache> sdks)
-      : db_(std::move(db)), sdks_(std::move(sdks)) {}
+  Store(std::unique_ptr<Database> db, std::shared_ptr<Sources> sources)
+      : db_(std::move(db)), sources_(std::move(sources)) {}
 
   os::Result<std::shared_ptr<const PlugInRecord>> onePlugIn(const std::string& where,
                                                             const std::string& key);
@@ -120,6 +120,9 @@ class Store {
   os::Result<std::shared_ptr<const PlugInRecord>> plugInRow(
       const Statement& row, std::uint64_t sdkGeneration,
       std::shared_ptr<const ApplicationRecord>* previous = nullptr);
+  // Fills the signature of |fields| from |row| and the entitlements it honours, judged by the
+  // trust store as it is now.
+  void judge(const Statement& row, PlugInRecord::Fields& fields);
   static std::shared_ptr<const ApplicationRecord> applicationRow(const Statement& row, int first);
 
   // The lists plugIns() returned, by selection, and what they were read at: reused while the
@@ -135,7 +138,7 @@ class Store {
   static constexpr std::size_t kMaxSnapshotLists = 64;
 
   std::unique_ptr<Database> db_;
-  const std::shared_ptr<sdk::SdkCache> sdks_;
+  const std::shared_ptr<Sources> sources_;
   std::set<std::string> reportedDamaged_;
   Snapshot snapshot_;
 };

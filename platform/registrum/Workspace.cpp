@@ -73,6 +73,21 @@ bool endsWith(std::string_view text, std::string_view suffix) {
   return text.size() > suffix.size() && text.substr(text.size() - suffix.size()) == suffix;
 }
 
+// What verifying the bundle's signature finds now, with the signed digest of its executable.
+PlugInRecord::Fields::Signature signatureOf(const PlugInBundle& bundle) {
+  codesign::BundleSignature::Verification verified = codesign::BundleSignature::verify(bundle.path);
+  PlugInRecord::Fields::Signature signature;
+  signature.state = verified.state;
+  signature.signer = verified.signer;
+  signature.note = verified.reason;
+  if (std::optional<std::string> executable =
+          RecordFields::string(bundle.info, "QFBundleExecutable")) {
+    auto digest = verified.files.find(*executable);
+    if (digest != verified.files.end()) signature.executableDigest = digest->second;
+  }
+  return signature;
+}
+
 }  // namespace
 
 os::Result<std::shared_ptr<Workspace>> Workspace::defaultWorkspace() {
@@ -93,9 +108,9 @@ os::Result<std::shared_ptr<Workspace>> Workspace::open(const std::string& root) 
   os::Result<std::string> canonicalRoot = os::Paths::canonical(root);
   if (!canonicalRoot.ok()) return canonicalRoot.error();
   std::string rootPath = canonicalRoot.value() == "/" ? "" : canonicalRoot.value();
-  auto sdks = std::make_shared<sdk::SdkCache>(rootPath.empty() ? "/" : rootPath);
+  auto sources = std::make_shared<Sources>(rootPath.empty() ? "/" : rootPath);
   os::Result<std::unique_ptr<Store>> store =
-      Store::open(rootPath + "/var/db/registrum.sqlite", sdks, {rootPath + "/var/containers"});
+      Store::open(rootPath + "/var/db/registrum.sqlite", sources, {rootPath + "/var/containers"});
   if (!store.ok()) return store.error();
   // The registry lists what the user installed: no one else's to read. SQLite gives its journal
   // files the database file's mode.
@@ -107,14 +122,14 @@ os::Result<std::shared_ptr<Workspace>> Workspace::open(const std::string& root) 
     }
   }
   std::shared_ptr<Workspace> workspace(
-      new Workspace(rootPath, std::move(sdks), std::move(store.value())));
+      new Workspace(rootPath, std::move(sources), std::move(store.value())));
   workspace->reclaimContainers();
   return workspace;
 }
 
-Workspace::Workspace(std::string root, std::shared_ptr<sdk::SdkCache> sdks,
+Workspace::Workspace(std::string root, std::shared_ptr<Sources> sources,
                      std::unique_ptr<Store> store)
-    : root_(std::move(root)), sdks_(std::move(sdks)), store_(std::move(store)) {}
+    : root_(std::move(root)), sources_(std::move(sources)), store_(std::move(store)) {}
 
 Workspace::~Workspace() = default;
 
@@ -122,7 +137,7 @@ os::Status Workspace::addObserver(const std::shared_ptr<Observer>& observer) {
   std::lock_guard lock(watcherMutex_);
   if (!watcher_) {
     os::Result<std::unique_ptr<ChangeWatcher>> started =
-        ChangeWatcher::start(databasePath(), notifyFile(), sdks_);
+        ChangeWatcher::start(databasePath(), notifyFile(), sources_);
     if (!started.ok()) return started.error();
     watcher_ = std::move(started.value());
   }
@@ -141,7 +156,7 @@ void Workspace::removeObserver(const Observer* observer) {
 }
 
 std::uint64_t Workspace::sdkGeneration() const {
-  return sdks_->refresh();
+  return sources_->refresh();
 }
 
 os::Result<std::shared_ptr<const PlugInRecord>> Workspace::plugInForUuid(
@@ -461,7 +476,8 @@ os::Result<std::shared_ptr<const PlugInRecord>> Workspace::storePlugIn(
   fields.uuid = earlierUuid ? *earlierUuid : value::Uuid::random();
   fields.bundlePath = bundle.path;
   fields.containingApplication = std::move(application);
-  fields.entitlements = bundle.entitlements;
+  fields.declaredEntitlements = bundle.entitlements;
+  fields.signature = signatureOf(bundle);
   fields.registrationDate = now();
   fields.onSystemPartition = bundle.path.starts_with(root_ + "/System/");
   fields.infoDictionary = bundle.info;

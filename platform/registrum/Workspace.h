@@ -11,8 +11,8 @@
 #include "platform/registrum/ApplicationRecord.h"
 #include "platform/registrum/Observer.h"
 #include "platform/registrum/PlugInRecord.h"
+#include "platform/registrum/Sources.h"
 #include "platform/registrum/Store.h"
-#include "platform/sdk/SdkCache.h"
 #include "platform/value/Value.h"
 
 namespace registrum {
@@ -178,7 +178,7 @@ class Workspace {
  private:
   struct PendingFiles;
 
-  Workspace(std::string root, std::shared_ptr<sdk::SdkCache> sdks, std::unique_ptr<Store> store);
+  Workspace(std::string root, std::shared_ptr<Sources> sources, std::unique_ptr<Store> store);
 
   std::string databasePath() const;
   std::string notifyFile() const;
@@ -210,7 +210,7 @@ class Workspace {
   void reclaimContainers();
 
   const std::string root_;
-  const std::shared_ptr<sdk::SdkCache> sdks_;
+  const std::shared_ptr<Sources> sources_;
   const std::unique_ptr<Store> store_;
   mutable std::mutex storeMutex_;
   std::mutex watcherMutex_;

@@ -8,6 +8,7 @@
 #include <string>
 #include <string_view>
 
+#include "platform/os/DirectoryWatch.h"
 #include "platform/os/Error.h"
 #include "platform/sdk/SdkRegistry.h"
 #include "platform/value/Dictionary.h"
@@ -15,21 +16,16 @@
 namespace sdk {
 
 // The SDK dictionaries of one device root (SdkRegistry), each file read at its first use and kept
-// until the SDK directory "<root>/System/Library/SDKs" changes. One inotify descriptor
-// (close-on-exec, non-blocking) watches that directory, or its nearest existing ancestor while
-// it is missing, so that one made later is noticed too. The kernel queues an event before the
-// writer's write, rename or unlink returns, so a refresh() after that returns sees the change;
-// refresh() costs one read() when nothing changed. When nothing can be watched (no inotify, no
-// watch left) the failure is logged once, nothing is kept and every refresh() counts as a change,
-// which stays correct, only slower.
+// until the SDK directory "<root>/System/Library/SDKs" changes (os::DirectoryWatch: a refresh()
+// after a writer returned sees its change; one read() when nothing changed; when the directory
+// cannot be watched nothing is kept and every refresh() counts as a change).
 //
-// Safe for concurrent use from any thread: one mutex guards the descriptor, the generation and
-// the kept dictionaries. The dictionaries handed out are immutable values.
+// Safe for concurrent use from any thread: one mutex guards the generation and the kept
+// dictionaries. The dictionaries handed out are immutable values.
 class SdkCache {
  public:
   // Starts watching the SDK directory of the device root |root| (a directory path).
   explicit SdkCache(std::string root);
-  ~SdkCache();
   SdkCache(const SdkCache&) = delete;
   SdkCache& operator=(const SdkCache&) = delete;
 
@@ -48,26 +44,12 @@ class SdkCache {
   value::Dictionary resolve(const value::Dictionary& info);
 
  private:
-  // Watches the SDK directory, else its nearest existing ancestor, in place of the current
-  // watch; fails with the error of the last directory tried. Runs under mutex_.
-  os::Status watch();
-  // Whether the event |mask| on |name| of the watch |wd| means that the SDKs may have changed,
-  // and whether the watch must be set again (the watched directory went away, or the missing one
-  // may be there now).
-  void classify(int wd, std::uint32_t mask, std::string_view name, bool& changed,
-                bool& rewatch) const;
-  // Stops watching for good, with a log line saying why. Runs under mutex_.
-  void giveUp(const std::string& why);
   // The SDK dictionary of |point|: the kept one, else read now (and kept while watching).
   std::optional<value::Dictionary> sdkFor(const std::string& point);
 
   const SdkRegistry files_;
-  const std::string directory_;
+  os::DirectoryWatch watch_;
   std::mutex mutex_;
-  int fd_ = -1;
-  int watch_ = -1;
-  // While an ancestor is watched: the name in it that leads to the SDK directory.
-  std::string nextName_;
   std::uint64_t generation_ = 0;
   std::map<std::string, std::optional<value::Dictionary>, std::less<>> kept_;
 };

@@ -15,6 +15,11 @@ inline void writePlist(const std::string& path, const value::Value& plist) {
   std::ofstream(path, std::ios::trunc) << value::PropertyList::toXml(plist).value();
 }
 
+inline void writeFile(const std::string& path, const std::string& contents) {
+  std::filesystem::create_directories(std::filesystem::path(path).parent_path());
+  std::ofstream(path, std::ios::trunc) << contents;
+}
+
 // What a plug-in bundle declares beyond a well-formed minimum.
 struct PlugInContents {
   std::string id;

@@ -149,9 +149,12 @@ TEST_F(WorkspaceTest, ReopeningKeepsRecordsMigratesAnOldSchemaAndSetsAForeignOne
     EXPECT_EQ(sqlite3_exec(db, sql, nullptr, nullptr, nullptr), SQLITE_OK) << sql;
     sqlite3_close(db);
   };
-  // A version 1 database, which kept the plug-in dictionary resolved at registration, is
-  // migrated, and its records follow the SDKs of today.
+  // A version 1 database, which kept the plug-in dictionary resolved at registration and knew
+  // no signatures, is migrated, and its records follow the SDKs of today.
   execute(
+      "ALTER TABLE plugins DROP COLUMN signature; ALTER TABLE plugins DROP COLUMN signer; "
+      "ALTER TABLE plugins DROP COLUMN signature_note; "
+      "ALTER TABLE plugins DROP COLUMN executable_digest; "
       "ALTER TABLE plugins ADD COLUMN plugin_dictionary BLOB NOT NULL DEFAULT x'A0'; "
       "UPDATE schema_version SET version = 1");
   root_.writePlist(

@@ -1,5 +1,6 @@
 #include "tools/rgctl/RecordJson.h"
 
+#include "platform/codesign/TrustStore.h"
 #include "tools/axctl/ValueJson.h"
 
 namespace {
@@ -12,6 +13,17 @@ ordered_json optional(const std::optional<std::string>& text) {
 
 ordered_json dictionary(const value::Dictionary& entries) {
   return toJson(value::Value::dictionary(entries));
+}
+
+ordered_json signatureJson(const registrum::PlugInRecord::Fields::Signature& signature) {
+  return {
+      {"outcome", codesign::TrustStore::outcomeName(signature.outcome)},
+      {"state", codesign::BundleSignature::stateName(signature.state)},
+      {"signer", signature.signer.empty() ? ordered_json(nullptr) : ordered_json(signature.signer)},
+      {"why",
+       signature.distrust.empty() ? ordered_json(nullptr) : ordered_json(signature.distrust)},
+      {"executableDigest", optional(signature.executableDigest)},
+  };
 }
 
 }  // namespace
@@ -44,7 +56,9 @@ ordered_json RecordJson::full(const registrum::PlugInRecord& record) {
       {"registrationDate", record.registrationDate()},
       {"onSystemPartition", record.onSystemPartition()},
       {"dataContainer", optional(record.dataContainerPath())},
+      {"signature", signatureJson(record.signature())},
       {"entitlements", dictionary(record.entitlements())},
+      {"declaredEntitlements", dictionary(record.declaredEntitlements())},
       {"plugInDictionary", dictionary(record.plugInDictionary())},
       {"infoDictionary", dictionary(record.infoDictionary())},
   };

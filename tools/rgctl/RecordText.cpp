@@ -3,6 +3,7 @@
 #include <iomanip>
 #include <sstream>
 
+#include "platform/codesign/TrustStore.h"
 #include "tools/axctl/ValueJson.h"
 
 namespace {
@@ -51,7 +52,12 @@ std::string RecordText::plugInDetails(const registrum::PlugInRecord& record) {
   field(out, "registration date", date.str());
   field(out, "system partition", record.onSystemPartition() ? "yes" : "no");
   field(out, "data container", orDash(record.dataContainerPath()));
+  const registrum::PlugInRecord::Fields::Signature& signature = record.signature();
+  field(out, "signature", std::string(codesign::TrustStore::outcomeName(signature.outcome)));
+  if (!signature.signer.empty()) field(out, "signer", signature.signer);
+  if (!signature.distrust.empty()) field(out, "why", signature.distrust);
   field(out, "entitlements", json(record.entitlements()));
+  field(out, "declared entitlements", json(record.declaredEntitlements()));
   field(out, "plug-in dictionary", json(record.plugInDictionary()));
   field(out, "info dictionary", json(record.infoDictionary()));
   return out.str();
