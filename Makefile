@@ -49,7 +49,7 @@ bench: bootstrap
 # Each target runs for FUZZ_SECONDS from its committed seeds; new inputs it finds stay in
 # $(FUZZ_BUILD)/corpus/<directory>. `make test` replays the committed seeds (docs/fuzzing.md).
 FUZZ_TARGETS = FrameDecoderFuzz:frame PropertyListFuzz:plist CborCodecFuzz:cbor \
-  EntitlementEntryFuzz:entitlements SdkMergeFuzz:sdk ActivationRuleFuzz:activation \
+  EntitlementEntryFuzz:entitlements SigningFileFuzz:signing SdkMergeFuzz:sdk ActivationRuleFuzz:activation \
   ExtensionTokenFuzz:token ServiceFileFuzz:service RecordCodecFuzz:record \
   AnnotationFileFuzz:annotations MatchRuleFuzz:match RequestDispatchFuzz:dispatch
 

@@ -81,43 +81,6 @@ BundleSignature::Verification tampered(std::string reason) {
   return {BundleSignature::State::Tampered, {}, std::move(reason), {}};
 }
 
-// The signature file's fields; the reason it is malformed otherwise.
-struct SignatureFile {
-  std::optional<SigningKey> key;
-  BundleSignature::Digests files;
-  value::Data signature;
-  std::string malformed;
-};
-
-SignatureFile parse(const value::Value& file) {
-  SignatureFile parsed;
-  const value::Dictionary* fields = file.asDictionary();
-  const value::Value* format = fields ? fields->find("Format") : nullptr;
-  const value::Value* publicKey = fields ? fields->find("PublicKey") : nullptr;
-  const value::Value* listed = fields ? fields->find("Files") : nullptr;
-  const value::Value* signature = fields ? fields->find("Signature") : nullptr;
-  if (!format || format->integerValue() != kFormat || !publicKey || !publicKey->asData() ||
-      !listed || !listed->asDictionary() || !signature || !signature->asData()) {
-    parsed.malformed = "the signature file is not of format 1";
-    return parsed;
-  }
-  os::Result<SigningKey> key = SigningKey::fromPublic(*publicKey->asData());
-  if (!key.ok()) {
-    parsed.malformed = "the signature file's key: " + key.error().message;
-    return parsed;
-  }
-  parsed.key = std::move(key).value();
-  for (const auto& [path, digest] : *listed->asDictionary()) {
-    if (!digest.asString()) {
-      parsed.malformed = "the signature file's digest of " + path + " is no string";
-      return parsed;
-    }
-    parsed.files[path] = *digest.asString();
-  }
-  parsed.signature = *signature->asData();
-  return parsed;
-}
-
 // The first difference between the signed digests and the bundle's; empty when there is none.
 std::string difference(const BundleSignature::Digests& signed_,
                        const BundleSignature::Digests& now) {
@@ -133,6 +96,27 @@ std::string difference(const BundleSignature::Digests& signed_,
 }
 
 }  // namespace
+
+os::Result<BundleSignature::SignatureFile> BundleSignature::parse(const value::Value& file) {
+  const value::Dictionary* fields = file.asDictionary();
+  const value::Value* format = fields ? fields->find("Format") : nullptr;
+  const value::Value* publicKey = fields ? fields->find("PublicKey") : nullptr;
+  const value::Value* listed = fields ? fields->find("Files") : nullptr;
+  const value::Value* signature = fields ? fields->find("Signature") : nullptr;
+  if (!format || format->integerValue() != kFormat || !publicKey || !publicKey->asData() ||
+      !listed || !listed->asDictionary() || !signature || !signature->asData()) {
+    return refused("the signature file is not of format 1");
+  }
+  os::Result<SigningKey> key = SigningKey::fromPublic(*publicKey->asData());
+  if (!key.ok()) return refused("the signature file's key: " + key.error().message);
+  Digests files;
+  for (const auto& [path, digest] : *listed->asDictionary()) {
+    if (!digest.asString())
+      return refused("the signature file's digest of " + path + " is no string");
+    files[path] = *digest.asString();
+  }
+  return SignatureFile{std::move(key).value(), std::move(files), *signature->asData()};
+}
 
 os::Result<BundleSignature::Digests> BundleSignature::digests(const std::string& bundle) {
   Digests files;
@@ -178,16 +162,17 @@ BundleSignature::Verification BundleSignature::verify(const std::string& bundle)
   if (!S_ISREG(st.st_mode)) return tampered("the signature file is not a regular file");
   os::Result<value::Value> file = value::PropertyList::readFile(path);
   if (!file.ok()) return tampered("the signature file: " + file.error().message);
-  SignatureFile parsed = parse(file.value());
-  if (!parsed.malformed.empty()) return tampered(parsed.malformed);
-  if (!parsed.key->verify(message(parsed.files), parsed.signature)) {
+  os::Result<SignatureFile> parsed = parse(file.value());
+  if (!parsed.ok()) return tampered(parsed.error().message);
+  const SignatureFile& signature = parsed.value();
+  if (!signature.key.verify(message(signature.files), signature.signature)) {
     return tampered("the signature does not verify");
   }
   os::Result<Digests> now = digests(bundle);
   if (!now.ok()) return tampered(now.error().message);
-  std::string changed = difference(parsed.files, now.value());
+  std::string changed = difference(signature.files, now.value());
   if (!changed.empty()) return tampered(changed);
-  return {State::Signed, parsed.key->keyId(), {}, std::move(parsed.files)};
+  return {State::Signed, signature.key.keyId(), {}, signature.files};
 }
 
 std::string_view BundleSignature::stateName(State state) {

@@ -7,6 +7,7 @@
 
 #include "platform/codesign/SigningKey.h"
 #include "platform/os/Error.h"
+#include "platform/value/Value.h"
 
 namespace codesign {
 
@@ -46,6 +47,17 @@ class BundleSignature {
   // symbolic link, a file that is neither regular nor a directory, a name with a line break, or
   // more than kMaxFiles files or kMaxBytes bytes; with the system's error when it cannot be read.
   static os::Result<Digests> digests(const std::string& bundle);
+  // A signature file's contents.
+  struct SignatureFile {
+    SigningKey key;
+    Digests files;
+    value::Data signature;
+  };
+  // The contents of the signature file |file| (a property list as read). Fails with EINVAL,
+  // saying why, when it is not a dictionary of format 1 with a 32-byte "PublicKey", "Files" of
+  // string digests and "Signature" data. Nothing is verified here.
+  static os::Result<SignatureFile> parse(const value::Value& file);
+
   // The text a signature covers: kHeader, then one line "<digest>  <path>\n" per file in order.
   static std::string message(const Digests& files);
 

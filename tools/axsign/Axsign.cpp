@@ -1,5 +1,6 @@
 #include "tools/axsign/Axsign.h"
 
+#include <filesystem>
 #include <iostream>
 #include <nlohmann/json.hpp>
 
@@ -49,6 +50,9 @@ os::Status writeTrustFile(const SigningKey& key, const std::string& path,
   }
   auto xml = value::PropertyList::toXml(value::Value::dictionary(value::Dictionary(fields)));
   if (!xml.ok()) return xml.error();
+  std::string directory = std::filesystem::path(path).parent_path();
+  os::Status made = os::Paths::ensureDirectory(directory.empty() ? "." : directory, 0755);
+  if (!made.ok()) return made;
   // Only files that no one but their owner may write count in a trust store.
   return os::AtomicFile::replace(path, xml.value(), os::AtomicFile::Durability::Durable, 0644);
 }
