@@ -139,6 +139,27 @@ TEST_F(SignatureTest, AChangeToAnyFileOfASignedBundleIsCaughtAtRegistration) {
   }
 }
 
+// The trust store is read again when it changes: a key trusted after its bundles were registered
+// counts at the next discovery, and one removed stops counting.
+TEST_F(SignatureTest, AKeyTrustedOrDistrustedLaterCountsAtTheNextDiscovery) {
+  SigningKey key = SigningKey::generate().value();
+  const Dictionary granted{{"vendor.feature", Value::boolean(true)}};
+  std::string bundle =
+      bundles::plugIn(root(), "Late", {.id = "late.tool", .entitlements = granted});
+  sign(root() + "/Late.app", key);
+  add({bundle});
+  EXPECT_EQ(*formOf("late.tool").find("entitlements"), Value::dictionary({}));
+  const auto& publicKey = key.publicKey();
+  std::string trustFile = root() + "/etc/annexa/trust.d/late.plist";
+  bundles::writePlist(
+      trustFile,
+      Value::dictionary(
+          {{"PublicKey", Value::data(value::Data(publicKey.begin(), publicKey.end()))}}));
+  EXPECT_EQ(*formOf("late.tool").find("entitlements"), Value::dictionary(granted));
+  std::filesystem::remove(trustFile);
+  EXPECT_EQ(*formOf("late.tool").find("entitlements"), Value::dictionary({}));
+}
+
 // An executable swapped after registration is refused when a host asks for the plug-in, and a
 // file swapped after that is not what the launcher starts.
 TEST_F(SignatureTest, ASwappedExecutableIsRefusedAtReadyAndAtStart) {
