@@ -1,8 +1,6 @@
 // The service queue's own thread: every piece of work runs once, one at a time, in the order
 // each submitter gave it, whether the thread slept, was busy or was being stopped.
 
-#include "platform/zyn/ThreadQueue.h"
-
 #include <gtest/gtest.h>
 
 #include <atomic>
@@ -10,6 +8,8 @@
 #include <future>
 #include <thread>
 #include <vector>
+
+#include "platform/zyn/ThreadQueue.h"
 
 namespace {
 
@@ -34,7 +34,8 @@ TEST(ThreadQueueTest, WorkOfManySubmittersRunsOnceEachInTheirOrderAndNeverOverla
             seen[s].push_back(i);
             running.fetch_sub(1);
           });
-          // Now and then the queue runs dry and sleeps, so wake-ups race with submissions.
+          // Now and then the queue runs dry and sleeps, so wake-ups race with submissions; a
+          // lost one would leave the rest unrun.
           if (i % 1000 == 0) std::this_thread::sleep_for(std::chrono::microseconds(200));
         }
       });
@@ -46,18 +47,6 @@ TEST(ThreadQueueTest, WorkOfManySubmittersRunsOnceEachInTheirOrderAndNeverOverla
   for (int s = 0; s < kSubmitters; ++s) {
     ASSERT_EQ(seen[s].size(), static_cast<std::size_t>(kEach)) << "submitter " << s;
     for (int i = 0; i < kEach; ++i) ASSERT_EQ(seen[s][i], i) << "submitter " << s;
-  }
-}
-
-TEST(ThreadQueueTest, WorkSubmittedToAnIdleQueueRuns) {
-  ThreadQueue queue("test.idle");
-  for (int round = 0; round < 3; ++round) {
-    // Long enough for the thread to have gone to sleep.
-    std::this_thread::sleep_for(std::chrono::milliseconds(20));
-    std::promise<void> ran;
-    queue.async([&] { ran.set_value(); });
-    EXPECT_EQ(ran.get_future().wait_for(std::chrono::seconds(10)), std::future_status::ready)
-        << "round " << round;
   }
 }
 
