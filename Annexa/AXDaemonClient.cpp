@@ -70,8 +70,8 @@ void AXDaemonClient::set(Request& request, const std::vector<value::Uuid>& uuids
   request[AXProtocol::kUuids] = Value::array(std::move(array));
 }
 
-void AXDaemonClient::send(const Request& request, ReplyHandler reply) {
-  axd_->sendWithReply(Value::dictionary(value::Dictionary(request)), std::move(reply));
+void AXDaemonClient::send(Request request, ReplyHandler reply) {
+  axd_->sendWithReply(Value::dictionary(value::Dictionary(std::move(request))), std::move(reply));
 }
 
 void AXDaemonClient::addPlugIns(const std::vector<std::string>& paths, ReplyHandler reply) {
@@ -85,7 +85,7 @@ void AXDaemonClient::removePlugIns(const std::vector<std::string>& paths, ReplyH
 void AXDaemonClient::bulkPlugins(std::uint64_t flags, ReplyHandler reply) {
   Request r = request(AXProtocol::kBulk);
   r[AXProtocol::kFlags] = Value::unsignedInteger(flags);
-  send(r, std::move(reply));
+  send(std::move(r), std::move(reply));
 }
 
 void AXDaemonClient::readyPlugIns(const std::vector<value::Uuid>& uuids, std::uint64_t flags,
@@ -103,7 +103,7 @@ void AXDaemonClient::matchPlugIns(const std::optional<value::Dictionary>& rule, 
   Request r = request(AXProtocol::kMatch);
   if (rule) r[AXProtocol::kRules] = value::PlistBridge::toMessage(Value::dictionary(*rule));
   r[AXProtocol::kFlags] = Value::unsignedInteger(flags);
-  send(r, std::move(reply));
+  send(std::move(r), std::move(reply));
 }
 
 void AXDaemonClient::setPluginAnnotations(const std::vector<value::Uuid>& uuids,
@@ -112,20 +112,20 @@ void AXDaemonClient::setPluginAnnotations(const std::vector<value::Uuid>& uuids,
   Request r = request(AXProtocol::kAnnotate);
   set(r, uuids);
   r[AXProtocol::kAnnotations] = value::PlistBridge::toMessage(Value::dictionary(annotations));
-  send(r, std::move(reply));
+  send(std::move(r), std::move(reply));
 }
 
 void AXDaemonClient::holdPlugins(const std::vector<std::string>& paths, std::uint64_t flags,
                                  ReplyHandler reply) {
   Request r = request(AXProtocol::kLock, paths);
   r[AXProtocol::kFlags] = Value::unsignedInteger(flags);
-  send(r, std::move(reply));
+  send(std::move(r), std::move(reply));
 }
 
 void AXDaemonClient::releaseHold(const value::Uuid& token, ReplyHandler reply) {
   Request r = request(AXProtocol::kLock);
   set(r, {token});
-  send(r, std::move(reply));
+  send(std::move(r), std::move(reply));
 }
 
 std::optional<AXError> AXDaemonClient::errorInReply(const zyn::ReplyOrError& reply) {

@@ -51,7 +51,7 @@ class AXDaemonClient {
   Request request(const char* type, const std::vector<value::Uuid>& uuids,
                   std::uint64_t flags) const;
   static void set(Request& request, const std::vector<value::Uuid>& uuids);
-  void send(const Request& request, ReplyHandler reply);
+  void send(Request request, ReplyHandler reply);
 
   void addPlugIns(const std::vector<std::string>& paths, ReplyHandler reply);
   void removePlugIns(const std::vector<std::string>& paths, ReplyHandler reply);

@@ -43,7 +43,8 @@ class AXDatabase : public registrum::Observer, public std::enable_shared_from_th
 
   // Empties the cache when an SDK was added, changed or removed since the last call: a cached
   // record keeps the plug-in dictionary it was built with. Costs one system call (the registry
-  // takes its queued SDK changes); called once at the start of each request. Takes _sync.
+  // takes its queued SDK changes); called once at the start of each request that reads records.
+  // Takes _sync.
   void noteSdkChanges();
 
   // The cached record of |rgData|, else a new one (createPlugInForProxy). Takes _sync.

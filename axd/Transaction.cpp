@@ -13,18 +13,30 @@ namespace {
 struct Handler {
   std::string_view type;
   void (Transaction::*serve)();
+  // False for a request that reads no plug-in record: it need not take the SDK changes first
+  // (a system call); the next request that reads records takes them.
+  bool readsRecords;
 };
 
 constexpr Handler kHandlers[] = {
-    {AXProtocol::kAdd, &Transaction::addPlugIns},
-    {AXProtocol::kRemove, &Transaction::removePlugIns},
-    {AXProtocol::kBulk, &Transaction::bulkPlugIns},
-    {AXProtocol::kMatch, &Transaction::matchPlugIns},
-    {AXProtocol::kReady, &Transaction::readyPlugIns},
-    {AXProtocol::kAccess, &Transaction::accessPlugIns},
-    {AXProtocol::kAnnotate, &Transaction::annotatePlugIns},
-    {AXProtocol::kLock, &Transaction::lockDownPlugIns},
+    {AXProtocol::kAdd, &Transaction::addPlugIns, true},
+    {AXProtocol::kRemove, &Transaction::removePlugIns, true},
+    {AXProtocol::kBulk, &Transaction::bulkPlugIns, false},
+    {AXProtocol::kMatch, &Transaction::matchPlugIns, true},
+    {AXProtocol::kReady, &Transaction::readyPlugIns, true},
+    {AXProtocol::kAccess, &Transaction::accessPlugIns, true},
+    {AXProtocol::kAnnotate, &Transaction::annotatePlugIns, true},
+    {AXProtocol::kLock, &Transaction::lockDownPlugIns, true},
 };
+
+// The handler of |type|; null for a missing or unknown type.
+const Handler* handlerFor(const std::string* type) {
+  if (!type) return nullptr;
+  for (const Handler& handler : kHandlers) {
+    if (*type == handler.type) return &handler;
+  }
+  return nullptr;
+}
 
 }  // namespace
 
@@ -51,7 +63,8 @@ void Transaction::dispatch() {
     return;
   }
   if (!client_->acceptWork()) return;
-  server()->noteSdkChanges();
+  const Handler* handler = handlerFor(type);
+  if (handler && handler->readsRecords) server()->noteSdkChanges();
   pid_t pid = client_->pid();
   const char* typeText = type ? type->c_str() : nullptr;
   server()->debug("client %d request %s", {pid, typeText});
@@ -60,13 +73,11 @@ void Transaction::dispatch() {
     fail(AXProtocol::kMalformedRequest, "invalid request format (missing type)");
     return;
   }
-  for (const Handler& handler : kHandlers) {
-    if (*type == handler.type) {
-      (this->*handler.serve)();
-      return;
-    }
+  if (!handler) {
+    fail(AXProtocol::kMalformedRequest, "unrecognized request");
+    return;
   }
-  fail(AXProtocol::kMalformedRequest, "unrecognized request");
+  (this->*handler->serve)();
 }
 
 void Transaction::done() {

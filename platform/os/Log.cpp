@@ -55,13 +55,12 @@ std::string_view bounded(std::string_view message, std::string& storage) {
   return storage;
 }
 
-}  // namespace
-
-void Log::write(int level, std::string_view whole) {
+// Writes |whole| to syslog when |toSyslog|, and to standard error when the sink says so.
+void emit(int level, std::string_view whole, bool toSyslog) {
   std::string storage;
   std::string_view message = bounded(whole, storage);
   const Sink& s = sink();
-  if (syslogListens()) syslog(level, "%.*s", static_cast<int>(message.size()), message.data());
+  if (toSyslog) syslog(level, "%.*s", static_cast<int>(message.size()), message.data());
   if (!s.toStderr) return;
   std::string line = s.prefix;
   line.append(message);
@@ -71,8 +70,17 @@ void Log::write(int level, std::string_view whole) {
   (void)ignored;
 }
 
+}  // namespace
+
+void Log::write(int level, std::string_view message) {
+  emit(level, message, syslogListens());
+}
+
 void Log::notice(std::string_view format, std::initializer_list<FormatArg> arguments) {
-  write(5, os::format(format, arguments));
+  bool toSyslog = syslogListens();
+  // A line that no sink takes is not formatted: some are written for every request.
+  if (!toSyslog && !sink().toStderr) return;
+  emit(5, os::format(format, arguments), toSyslog);
 }
 
 }  // namespace os

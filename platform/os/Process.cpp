@@ -121,4 +121,23 @@ Result<FileIdentity> Process::executableIdentity(pid_t pid) {
   return FileIdentity{status.st_dev, status.st_ino};
 }
 
+Result<int> Process::openProcDirectory(pid_t pid, int pidfd) {
+  if (pidfd < 0) return noPidfd();
+  const std::string path = "/proc/" + std::to_string(pid);
+  int fd = open(path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC);
+  if (fd < 0) return Error::fromErrno("open " + path);
+  Status alive = checkAlive(pidfd);
+  if (!alive.ok()) {
+    close(fd);
+    return alive.error();
+  }
+  return fd;
+}
+
+Result<FileIdentity> Process::executableIdentityAt(int procDirectory) {
+  struct stat status {};
+  if (fstatat(procDirectory, "exe", &status, 0) != 0) return Error::fromErrno("stat exe");
+  return FileIdentity{status.st_dev, status.st_ino};
+}
+
 }  // namespace os

@@ -51,6 +51,14 @@ class Process {
   // program in between shows. Fails with ENOENT for a zombie or a process that is gone, EACCES
   // for a process we may not inspect.
   static Result<FileIdentity> executableIdentity(pid_t pid);
+
+  // A descriptor of |pid|'s directory in /proc (O_PATH, close-on-exec), checked against |pidfd|
+  // like executablePath(); the caller owns it. Lookups through it fail once that process is
+  // gone, even after its pid went to another process. Fails as executablePath() does.
+  static Result<int> openProcDirectory(pid_t pid, int pidfd);
+  // executableIdentity() through a descriptor from openProcDirectory(): one lookup of "exe" in
+  // place of a walk from the root. Fails with ENOENT for a zombie or a process that is gone.
+  static Result<FileIdentity> executableIdentityAt(int procDirectory);
 };
 
 }  // namespace os

@@ -72,6 +72,7 @@ Connection::Connection(asio::local::stream_protocol::socket socket, PeerCredenti
 
 Connection::~Connection() {
   if (peer_.pidfd >= 0) close(peer_.pidfd);
+  if (peer_.procDirectory >= 0) close(peer_.procDirectory);
 }
 
 void Connection::setEventHandler(EventHandler handler) {
@@ -138,6 +139,8 @@ void Connection::readAvailable() {
     return;
   }
   decoder_.commit(n.value());
+  // Every frame of this read was written before it, so one check covers them all.
+  std::optional<bool> sameProgram;
   for (;;) {
     auto next = decoder_.next();
     if (!next.ok()) {
@@ -149,7 +152,8 @@ void Connection::readAvailable() {
     if (!next.value()) break;
     // Only work is checked: a goodbye from a client that has exited since is no harm.
     bool work = next.value()->kind == FrameKind::Request || next.value()->kind == FrameKind::OneWay;
-    if (work && !peerRunsSameProgram()) {
+    if (work && !sameProgram) sameProgram = peerRunsSameProgram();
+    if (work && !*sameProgram) {
       std::string why = "the peer is gone or runs another program than when it connected";
       os::Log::write(4, os::format("closing connection %@: %s", {description(), why}));
       invalidate(why);
@@ -189,7 +193,8 @@ os::Result<std::size_t> Connection::receive() {
 
 bool Connection::peerRunsSameProgram() const {
   if (!checksPeer_) return true;
-  auto now = os::Process::executableIdentity(peer_.pid);
+  auto now = peer_.procDirectory >= 0 ? os::Process::executableIdentityAt(peer_.procDirectory)
+                                      : os::Process::executableIdentity(peer_.pid);
   return peer_.program && now.ok() && now.value() == *peer_.program;
 }
 

@@ -31,6 +31,9 @@ struct PeerCredentials {
   int pidfd = -1;
   // The program file the peer ran when the connection was accepted; nothing when unknown.
   std::optional<os::FileIdentity> program;
+  // The peer's directory in /proc (os::Process::openProcDirectory), through which its program
+  // is checked; -1 when none could be opened, and the check then goes by pid.
+  int procDirectory = -1;
 };
 
 // One connection of the message service, either end. Events (messages and the two terminal

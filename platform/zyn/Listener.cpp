@@ -61,7 +61,10 @@ PeerCredentials credentialsOf(int fd) {
     auto opened = os::Process::openPidfd(peer.pid);
     if (opened.ok()) peer.pidfd = opened.value();
   }
-  auto program = os::Process::executableIdentity(peer.pid);
+  auto directory = os::Process::openProcDirectory(peer.pid, peer.pidfd);
+  if (peer.pid > 0 && directory.ok()) peer.procDirectory = directory.value();
+  auto program = peer.procDirectory >= 0 ? os::Process::executableIdentityAt(peer.procDirectory)
+                                         : os::Process::executableIdentity(peer.pid);
   if (peer.pid > 0 && program.ok()) peer.program = program.value();
   return peer;
 }
@@ -226,6 +229,7 @@ void Listener::accepted(int fd) {
     os::Log::write(4, "cannot adopt a connection to " + serviceName_ + ": " + ec.message());
     close(fd);
     if (peer.pidfd >= 0) close(peer.pidfd);
+    if (peer.procDirectory >= 0) close(peer.procDirectory);
     return;
   }
   auto connection = Connection::accepted(std::move(socket), peer, serviceName_, limits_);

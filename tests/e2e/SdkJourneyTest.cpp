@@ -35,8 +35,10 @@ TEST_F(SdkJourneyTest, AnSdkAddedChangedOrRemovedCountsAtTheNextDiscovery) {
   const Dictionary guarded{{"QSExtensionHostEntitlement", Value::string("sdk.host")}};
   EXPECT_EQ(matchIds(), both);  // the daemon now holds both records
 
-  // The SDK now demands a host entitlement: only a host that has it sees the plug-ins.
+  // The SDK now demands a host entitlement: only a host that has it sees the plug-ins. A bulk
+  // request in between reads no record and leaves the change to the discovery after it.
   writeSdk(guarded);
+  EXPECT_EQ(client().bulk(0), "ok");
   EXPECT_EQ(matchIds(), Ids{});
   grant({{"sdk.host", Value::boolean(true)}});
   EXPECT_EQ(matchIds(), both);

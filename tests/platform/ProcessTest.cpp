@@ -97,4 +97,24 @@ TEST(ProcessTest, StartTimesAreReadPastAnyCommandName) {
   EXPECT_EQ(Process::startTime(0).error().errnum, ESRCH);
 }
 
+TEST(ProcessTest, AProcDirectoryNamesItsProcessOnlyWhileThatProcessLives) {
+  pid_t child = sleeperNamed("procdir");
+  auto pidfd = Process::openPidfd(child);
+  ASSERT_TRUE(pidfd.ok());
+  auto directory = Process::openProcDirectory(child, pidfd.value());
+  ASSERT_TRUE(directory.ok());
+  auto through = Process::executableIdentityAt(directory.value());
+  auto byPid = Process::executableIdentity(child);
+  ASSERT_TRUE(through.ok() && byPid.ok());
+  EXPECT_EQ(through.value(), byPid.value());
+
+  kill(child, SIGKILL);
+  waitpid(child, nullptr, 0);
+  // Whoever gets the pid next, the directory still names the process that is gone.
+  EXPECT_FALSE(Process::executableIdentityAt(directory.value()).ok());
+  EXPECT_FALSE(Process::openProcDirectory(child, pidfd.value()).ok());
+  close(directory.value());
+  close(pidfd.value());
+}
+
 }  // namespace
