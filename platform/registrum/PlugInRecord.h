@@ -131,8 +131,9 @@ class PlugInRecord {
     return fields_.localizedShortName;
   }
 
-  // The SDK generation (Workspace::sdkGeneration) when the record was read: its plug-in
-  // dictionary reflects the SDKs of that generation or a later one. 0 in the records of notices
+  // The generation of the SDKs and trusted keys (Workspace::sdkGeneration) when the record was
+  // read: its plug-in dictionary and honoured entitlements reflect that generation or a later
+  // one. 0 in the records of notices
   // and in records built by hand.
   std::uint64_t sdkGeneration() const { return fields_.sdkGeneration; }
 

@@ -102,8 +102,8 @@ class Workspace {
 
   // --- Lookups (null pointer: not found) ---
 
-  // A number that grows whenever an SDK of this root is added, changed or removed; 0 until the
-  // first change. Takes the changes queued so far first (one system call), so a change whose
+  // A number that grows whenever an SDK of this root, or its trust store of signing keys, is
+  // added, changed or removed (Sources::refresh); 0 until the first change. Takes the changes queued so far first (one system call), so a change whose
   // write returned before this call counts. A caller that keeps something built from records
   // drops it when the number has grown since it last looked.
   std::uint64_t sdkGeneration() const;
