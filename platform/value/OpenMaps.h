@@ -17,6 +17,11 @@ namespace value {
 // and the map is sorted when it closes. Not thread-safe.
 class OpenMaps {
  public:
+  OpenMaps() = default;
+  // Its key indexes point at its own entries.
+  OpenMaps(const OpenMaps&) = delete;
+  OpenMaps& operator=(const OpenMaps&) = delete;
+
   // Opens a map; it is the innermost from now on.
   void open();
   // Adds an entry under |key| to the innermost map, awaiting its value; false, adding nothing,
