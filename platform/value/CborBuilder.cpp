@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstdint>
+#include <iterator>
 #include <utility>
 
 #include "platform/os/Format.h"
@@ -49,7 +50,7 @@ void CborBuilder::null() {
 void CborBuilder::byteString(const std::uint8_t* bytes, std::size_t length) {
   if (!admit(Item::Bytes)) return;
   if (!stack_.empty() && stack_.back().kind == Kind::ChunkedBytes) {
-    stack_.back().chunks.append(reinterpret_cast<const char*>(bytes), length);
+    chunks_.append(reinterpret_cast<const char*>(bytes), length);
     return;
   }
   if (takeTag() != CborCodec::kTagUuid) return deliver(Value::data(Data(bytes, bytes + length)));
@@ -61,21 +62,22 @@ void CborBuilder::byteString(const std::uint8_t* bytes, std::size_t length) {
 
 void CborBuilder::textString(const std::uint8_t* bytes, std::size_t length) {
   if (!admit(Item::Text)) return;
-  std::string text(reinterpret_cast<const char*>(bytes), length);
+  std::string_view text(reinterpret_cast<const char*>(bytes), length);
   if (!stack_.empty() && stack_.back().kind == Kind::ChunkedText) {
-    stack_.back().chunks += text;
+    chunks_ += text;
     return;
   }
   if (!Utf8::valid(text)) return fail("text string is not valid UTF-8");
-  deliver(Value::string(std::move(text)));
+  if (awaitsKey()) return deliverKey(text);
+  deliver(Value::string(std::string(text)));
 }
 
 void CborBuilder::startChunkedBytes() {
-  if (admit(Item::Other)) stack_.push_back(Open{Kind::ChunkedBytes, true});
+  startChunked(Kind::ChunkedBytes);
 }
 
 void CborBuilder::startChunkedText() {
-  if (admit(Item::Other)) stack_.push_back(Open{Kind::ChunkedText, true});
+  startChunked(Kind::ChunkedText);
 }
 
 void CborBuilder::startArray(std::optional<std::uint64_t> count) {
@@ -87,7 +89,7 @@ void CborBuilder::startMap(std::optional<std::uint64_t> count) {
   // A map of n pairs holds 2n items, each at least one byte long.
   if (count && *count > bytesLeft_ / 2)
     return fail("map declares more entries than the input holds");
-  startContainer(Kind::Map, count ? std::optional(*count * 2) : std::nullopt);
+  startContainer(Kind::Map, count);
 }
 
 void CborBuilder::tag(std::uint64_t number) {
@@ -102,7 +104,7 @@ void CborBuilder::tag(std::uint64_t number) {
 
 void CborBuilder::endIndefinite() {
   if (failed()) return;
-  if (stack_.empty() || !stack_.back().indefinite || pendingTag_ || stack_.back().key) {
+  if (stack_.empty() || !stack_.back().indefinite || pendingTag_ || stack_.back().keyed) {
     return fail("unexpected break");
   }
   Value value = finish(stack_.back());
@@ -146,12 +148,35 @@ void CborBuilder::startContainer(Kind kind, std::optional<std::uint64_t> items) 
     return fail("array declares more elements than the input holds");
   if (items == 0u) return deliver(kind == Kind::Array ? Value::array({}) : Value::dictionary({}));
   ++depth_;
-  stack_.push_back(Open{kind, !items, items.value_or(0)});
+  if (kind == Kind::Map) maps_.open();
+  stack_.push_back(Open{kind, !items, false, items.value_or(0), values_.size()});
+}
+
+void CborBuilder::startChunked(Kind kind) {
+  if (!admit(Item::Other)) return;
+  chunks_.clear();
+  stack_.push_back(Open{kind, true});
+}
+
+bool CborBuilder::awaitsKey() const {
+  return !stack_.empty() && stack_.back().kind == Kind::Map && !stack_.back().keyed;
+}
+
+// A key in plain text goes straight into its map's entry: it never becomes a value of its own.
+void CborBuilder::deliverKey(std::string_view key) {
+  if (counted()) addKey(stack_.back(), key);
+}
+
+// Counts one more finished item; false, recording the error, past the limit.
+bool CborBuilder::counted() {
+  if (++items_ <= maxItems_) return true;
+  fail(os::format("more than %u items", {maxItems_}));
+  return false;
 }
 
 // Hands a finished item to the innermost open container, closing every container it completes.
-void CborBuilder::deliver(Value value) {
-  if (++items_ > maxItems_) return fail(os::format("more than %u items", {maxItems_}));
+void CborBuilder::deliver(Value&& value) {
+  if (!counted()) return;
   while (!stack_.empty()) {
     if (!add(stack_.back(), std::move(value))) return;
     value = finish(stack_.back());
@@ -160,24 +185,30 @@ void CborBuilder::deliver(Value value) {
   result_ = std::move(value);
 }
 
-// Adds |value| to |open|; true when that completes it.
-bool CborBuilder::add(Open& open, Value value) {
-  if (open.kind != Kind::Map) {
-    open.elements.push_back(std::move(value));
-    return open.kind == Kind::Envelope || (!open.indefinite && --open.remaining == 0);
-  }
-  if (!open.key) {
+// Adds |value| to |open|; true when that completes it. A definite map counts its entries down.
+bool CborBuilder::add(Open& open, Value&& value) {
+  if (open.kind == Kind::Map && !open.keyed) {
+    // Plain text keys take deliverKey(); a key that comes here was chunked or is not text.
     const std::string* key = value.asString();
-    if (!key || open.entries.contains(*key)) {
-      fail(key ? "duplicate map key \"" + *key + "\"" : "map key is not a text string");
+    if (!key) {
+      fail("map key is not a text string");
       return false;
     }
-    open.key = *key;
-  } else {
-    open.entries.emplace(std::move(*open.key), std::move(value));
-    open.key.reset();
+    addKey(open, *key);
+    return false;
   }
-  return !open.indefinite && --open.remaining == 0;
+  if (open.kind == Kind::Map) {
+    maps_.setValue(std::move(value));
+    open.keyed = false;
+  } else {
+    values_.push_back(std::move(value));
+  }
+  return open.kind == Kind::Envelope || (!open.indefinite && --open.remaining == 0);
+}
+
+void CborBuilder::addKey(Open& open, std::string_view key) {
+  if (!maps_.addKey(key)) return fail("duplicate map key \"" + std::string(key) + "\"");
+  open.keyed = true;
 }
 
 // The value of a complete container or chunked string; records an error for chunked text that
@@ -185,23 +216,35 @@ bool CborBuilder::add(Open& open, Value value) {
 Value CborBuilder::finish(Open& open) {
   switch (open.kind) {
     case Kind::ChunkedBytes:
-      return Value::data(Data(open.chunks.begin(), open.chunks.end()));
+      return Value::data(Data(chunks_.begin(), chunks_.end()));
     case Kind::ChunkedText:
-      if (!Utf8::valid(open.chunks)) fail("text string is not valid UTF-8");
-      return Value::string(std::move(open.chunks));
+      if (!Utf8::valid(chunks_)) fail("text string is not valid UTF-8");
+      return Value::string(std::move(chunks_));
     case Kind::Array:
       --depth_;
-      // Decoded values may live long (registry records): keep no room left over from growing.
-      open.elements.shrink_to_fit();
-      return Value::array(std::move(open.elements));
+      return Value::array(takeValues(open.first));
     case Kind::Map:
       --depth_;
-      return Value::dictionary(Dictionary(std::move(open.entries)));
+      return Value::dictionary(maps_.close());
     case Kind::Envelope:
       --depth_;
-      return Value::envelope(std::move(open.elements.front()));
+      return Value::envelope(takeLast());
   }
   return Value();
+}
+
+// The elements from |first| on, moved into an array of exactly their number.
+Array CborBuilder::takeValues(std::size_t first) {
+  auto begin = values_.begin() + static_cast<std::ptrdiff_t>(first);
+  Array elements(std::make_move_iterator(begin), std::make_move_iterator(values_.end()));
+  values_.erase(begin, values_.end());
+  return elements;
+}
+
+Value CborBuilder::takeLast() {
+  Value last = std::move(values_.back());
+  values_.pop_back();
+  return last;
 }
 
 void CborBuilder::fail(std::string message) {

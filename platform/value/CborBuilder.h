@@ -1,11 +1,12 @@
 #pragma once
 
 #include <cstdint>
-#include <map>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
+#include "platform/value/OpenMaps.h"
 #include "platform/value/Value.h"
 
 namespace value {
@@ -57,22 +58,31 @@ class CborBuilder {
   enum class Item { UInt, NegInt, Float, Bytes, Text, Other };
   enum class Kind { Array, Map, Envelope, ChunkedBytes, ChunkedText };
 
+  // An open container or chunked string. What it holds so far waits in the builder's shared
+  // lists: an array's or envelope's elements in values_ from |first| on, a map's entries in
+  // maps_, a chunked string's chunks in chunks_ (chunked strings do not nest). So opening one
+  // allocates nothing.
   struct Open {
     Kind kind;
     bool indefinite = false;
-    std::uint64_t remaining = 0;  // Items still due in a definite array or map.
-    Array elements;
-    std::map<std::string, Value> entries;
-    std::optional<std::string> key;
-    std::string chunks;
+    bool keyed = false;           // A map whose last entry has its key but not yet its value.
+    std::uint64_t remaining = 0;  // Elements or entries still due in a definite container.
+    std::size_t first = 0;
   };
 
   bool admit(Item item);
   std::optional<std::uint64_t> takeTag();
   void startContainer(Kind kind, std::optional<std::uint64_t> items);
-  void deliver(Value value);
-  bool add(Open& open, Value value);
+  void startChunked(Kind kind);
+  bool awaitsKey() const;
+  void deliverKey(std::string_view key);
+  bool counted();
+  void deliver(Value&& value);
+  bool add(Open& open, Value&& value);
+  void addKey(Open& open, std::string_view key);
   Value finish(Open& open);
+  Array takeValues(std::size_t first);
+  Value takeLast();
   void fail(std::string message);
 
   std::size_t maxDepth_;
@@ -82,6 +92,9 @@ class CborBuilder {
   std::size_t bytesLeft_ = 0;
   std::optional<std::uint64_t> pendingTag_;
   std::vector<Open> stack_;
+  std::vector<Value> values_;
+  OpenMaps maps_;
+  std::string chunks_;
   std::optional<Value> result_;
   std::optional<std::string> error_;
 };

@@ -28,6 +28,9 @@ Dictionary::Dictionary(std::map<std::string, Value> entries)
     : entries_(std::make_shared<const std::vector<Entry>>(
           std::make_move_iterator(entries.begin()), std::make_move_iterator(entries.end()))) {}
 
+Dictionary::Dictionary(std::vector<Entry> sortedEntries)
+    : entries_(std::make_shared<const std::vector<Entry>>(std::move(sortedEntries))) {}
+
 Dictionary::Dictionary(std::shared_ptr<const std::vector<Entry>> entries)
     : entries_(std::move(entries)) {}
 

@@ -21,6 +21,9 @@ class Dictionary {
   Dictionary();
   Dictionary(std::initializer_list<Entry> entries);
   explicit Dictionary(std::map<std::string, Value> entries);
+  // Adopts |sortedEntries| as they are: the caller guarantees keys in ascending byte order, none
+  // twice. For a decoder that already has its entries in order, which need not go through a map.
+  explicit Dictionary(std::vector<Entry> sortedEntries);
 
   // The value stored under |key|, or null when there is none. The pointer lives as long as this
   // dictionary (or any copy of it).

@@ -27,10 +27,27 @@ std::size_t sequenceLength(std::string_view text) {
   return length;
 }
 
-// The length of the plain ASCII run at the start of |text|: the common case, and every string of
-// a reply is checked at every encoding, so it goes eight bytes at a time.
+constexpr std::uint64_t kHighBits = 0x8080808080808080ull;
+
+// Whether |text| is plain ASCII: the common case, and every string of a reply is checked at
+// every encoding and every decoding, so it goes eight bytes at a time, the last eight
+// overlapping the ones before, without stopping early.
+bool ascii(std::string_view text) {
+  std::uint64_t word = 0, seen = 0;
+  if (text.size() < sizeof word) {
+    for (char c : text) seen |= static_cast<std::uint8_t>(c);
+    return seen < 0x80;
+  }
+  for (std::size_t i = 0; i + sizeof word <= text.size(); i += sizeof word) {
+    std::memcpy(&word, text.data() + i, sizeof word);
+    seen |= word;
+  }
+  std::memcpy(&word, text.data() + text.size() - sizeof word, sizeof word);
+  return ((seen | word) & kHighBits) == 0;
+}
+
+// The length of the plain ASCII run at the start of |text|, eight bytes at a time.
 std::size_t asciiPrefix(std::string_view text) {
-  constexpr std::uint64_t kHighBits = 0x8080808080808080ull;
   std::size_t i = 0;
   for (std::uint64_t word = 0; i + sizeof word <= text.size(); i += sizeof word) {
     std::memcpy(&word, text.data() + i, sizeof word);
@@ -43,6 +60,7 @@ std::size_t asciiPrefix(std::string_view text) {
 }  // namespace
 
 bool Utf8::valid(std::string_view text) {
+  if (ascii(text)) return true;
   while (!text.empty()) {
     text.remove_prefix(asciiPrefix(text));
     if (text.empty()) return true;

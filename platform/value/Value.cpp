@@ -6,42 +6,46 @@
 namespace value {
 
 Value Value::boolean(bool b) {
-  return Value(Body(std::in_place_index<1>, b));
+  return Value(std::in_place_type<bool>, b);
 }
 Value Value::integer(std::int64_t i) {
-  return Value(Body(std::in_place_index<2>, i));
+  return Value(std::in_place_type<std::int64_t>, i);
 }
 Value Value::unsignedInteger(std::uint64_t u) {
-  return Value(Body(std::in_place_index<3>, u));
+  return Value(std::in_place_type<std::uint64_t>, u);
 }
 Value Value::real(double d) {
-  return Value(Body(std::in_place_index<4>, d));
+  return Value(std::in_place_type<double>, d);
 }
 
 Value Value::string(std::string s) {
-  return Value(Body(std::make_shared<const std::string>(std::move(s))));
+  return Value(std::in_place_type<std::shared_ptr<const std::string>>,
+               std::make_shared<const std::string>(std::move(s)));
 }
 
 Value Value::data(Data bytes) {
-  return Value(Body(std::make_shared<const Data>(std::move(bytes))));
+  return Value(std::in_place_type<std::shared_ptr<const Data>>,
+               std::make_shared<const Data>(std::move(bytes)));
 }
 Value Value::date(Date d) {
-  return Value(Body(d));
+  return Value(std::in_place_type<Date>, d);
 }
 Value Value::uuid(const Uuid& u) {
-  return Value(Body(u));
+  return Value(std::in_place_type<Uuid>, u);
 }
 
 Value Value::array(Array elements) {
-  return Value(Body(std::make_shared<const Array>(std::move(elements))));
+  return Value(std::in_place_type<std::shared_ptr<const Array>>,
+               std::make_shared<const Array>(std::move(elements)));
 }
 
 Value Value::dictionary(Dictionary entries) {
-  return Value(Body(std::move(entries)));
+  return Value(std::in_place_type<Dictionary>, std::move(entries));
 }
 
 Value Value::envelope(Value carried) {
-  return Value(Body(std::make_shared<const Value>(std::move(carried))));
+  return Value(std::in_place_type<std::shared_ptr<const Value>>,
+               std::make_shared<const Value>(std::move(carried)));
 }
 
 bool Value::isNumber() const {

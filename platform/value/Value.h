@@ -4,6 +4,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <utility>
 #include <variant>
 #include <vector>
 
@@ -91,7 +92,10 @@ class Value {
                    std::shared_ptr<const std::string>, std::shared_ptr<const Data>, Date, Uuid,
                    std::shared_ptr<const Array>, Dictionary, std::shared_ptr<const Value>>;
 
-  explicit Value(Body body) : body_(std::move(body)) {}
+  // Builds the body in place: values are made by the hundred thousand when a reply is decoded.
+  template <typename T, typename... Args>
+  explicit Value(std::in_place_type_t<T> type, Args&&... args)
+      : body_(type, std::forward<Args>(args)...) {}
 
   Body body_;
 };

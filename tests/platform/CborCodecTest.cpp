@@ -77,6 +77,8 @@ TEST(CborCodecTest, OtherWellFormedEncodingsAreAccepted) {
       {"bf 6161 01 ff", Value::dictionary({{"a", Value::unsignedInteger(1)}})},
       {"5f 420102 41 03 40 ff", Value::data({1, 2, 3})},
       {"7f 6161 62c3a9 ff", Value::string("a\xC3\xA9")},
+      {"bf 7f 6162 ff 01 6161 02 ff",
+       Value::dictionary({{"a", Value::unsignedInteger(2)}, {"b", Value::unsignedInteger(1)}})},
   };
   for (const auto& [hex, expected] : cases) {
     auto decoded = CborCodec::decode(fromHex(hex));
@@ -95,6 +97,9 @@ TEST(CborCodecTest, MalformedOrForeignItemsAreRefused) {
       {"bbffffffffffffffff 00", "more entries"},
       {"a1 01 02", "not a text string"},
       {"a2 6161 01 6161 02", "duplicate map key \"a\""},
+      {"a3 6162 01 6161 02 6162 03", "duplicate map key \"b\""},  // apart, out of order
+      {"a2 6161 01 7f 6161 ff 02", "duplicate map key \"a\""},    // a chunked key
+      {"a1 80 01", "not a text string"},
       {"c2 4100", "unsupported tag 2"},
       {"d825 4f 00112233445566778899aabbccddee", "16-byte"},
       {"d825 6161", "wrong type"},
@@ -123,6 +128,23 @@ TEST(CborCodecTest, MalformedOrForeignItemsAreRefused) {
     EXPECT_NE(decoded.error().message.find(message), std::string::npos)
         << hex << ": " << decoded.error().message;
   }
+}
+
+// Another encoder may write keys in any order; the dictionary is the same, and encodes sorted.
+// The inner maps' entries must not mix with those of the maps around them.
+TEST(CborCodecTest, MapsInAnyKeyOrderDecodeToSortedDictionaries) {
+  auto decoded = CborCodec::decode(
+      fromHex("a3 6163 a2 6179 01 6178 02 6161 a2 6178 03 6179 04 6162 bf 6162 05 6161 06 ff"));
+  ASSERT_TRUE(decoded.ok()) << decoded.error().message;
+  auto pair = [](std::uint64_t x, std::uint64_t y) {
+    return Value::dictionary({{"x", Value::unsignedInteger(x)}, {"y", Value::unsignedInteger(y)}});
+  };
+  Value expected = Value::dictionary({{"a", pair(3, 4)},
+                                      {"b", Value::dictionary({{"a", Value::unsignedInteger(6)},
+                                                               {"b", Value::unsignedInteger(5)}})},
+                                      {"c", pair(2, 1)}});
+  EXPECT_EQ(decoded.value(), expected);
+  EXPECT_EQ(toHex(encode(decoded.value())), toHex(encode(expected)));
 }
 
 std::vector<std::uint8_t> nestedArrays(std::size_t depth) {
